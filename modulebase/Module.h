@@ -1,0 +1,72 @@
+// Module: decouples the host's receive callbacks from a module's media processing.
+//
+// Owns three bounded queues (video 50, audio 20, meta 20 samples) and one worker thread per
+// queue. Producers (any thread) only enqueue and never block: a full queue drops the newest
+// sample with one "queue overflow (...)" line. Each worker pops its queue in order and calls
+// the derived class's Process* hook; no Module lock is held while a hook runs, so the three
+// hooks run concurrently and the derived class synchronises what they share.
+//
+// Shutdown and flushing use marker samples (payloadSize 0), which never reach the hooks.
+// StartThreads/StopThreads/FlushQueues are called from one controlling thread, never from a
+// worker. A Module must not be destroyed while its workers run.
+#pragma once
+
+#include <atomic>
+#include <condition_variable>
+#include <memory>
+#include <mutex>
+#include <thread>
+
+#include "modulebase/BoundedQueue.h"
+#include "modulebase/ModuleInterface.h"
+
+class Module : public ModuleInterface {
+public:
+    Module();
+    ~Module() override;
+
+    void PushVideo(std::shared_ptr<StreamData> sample) override;
+    void PushAudio(std::shared_ptr<StreamData> sample) override;
+    void PushMeta(std::shared_ptr<StreamData> sample) override;
+    void Restart() override;
+    // Pushes a marker into each queue in turn and waits until its worker has handled that very
+    // marker, so every flush waits for what was queued before it (an earlier flush or stop
+    // does not satisfy a later one). A queue whose worker is not running is not waited for.
+    void FlushQueues() override;
+    // Removes every queued real sample; markers stay.
+    void ClearQueues() override;
+
+    // Makes Clear keep markers and drop samples, then calls OnInitialize.
+    bool Initialize(std::shared_ptr<void> parameter);
+    // Starts the three workers. Only when none runs. Throws std::system_error when a thread
+    // cannot be created.
+    void StartThreads();
+    // Discards queued samples, wakes each worker with a marker and joins it. Safe to call
+    // again or before StartThreads.
+    void StopThreads();
+
+private:
+    using Queue = BoundedQueue<std::shared_ptr<StreamData>>;
+    enum class Media { Video, Audio, Meta };
+    void workerLoop(Media media);
+
+    Queue videoQueue_{50};
+    Queue audioQueue_{20};
+    Queue metaQueue_{20};
+    std::shared_ptr<std::thread> videoWorker_;
+    std::shared_ptr<std::thread> audioWorker_;
+    std::shared_ptr<std::thread> metaWorker_;
+    std::condition_variable videoMarkerCondition_;
+    bool videoMarkerSeen_ = false;  // guarded by markerMutex_, as are the *LastMarker_ fields
+    const StreamData* videoLastMarker_ = nullptr;  // the marker the worker handled last
+    std::condition_variable audioMarkerCondition_;
+    bool audioMarkerSeen_ = false;
+    const StreamData* audioLastMarker_ = nullptr;
+    std::condition_variable metaMarkerCondition_;
+    bool metaMarkerSeen_ = false;
+    const StreamData* metaLastMarker_ = nullptr;
+    std::mutex markerMutex_;
+    std::atomic<bool> videoRunning_{false};
+    std::atomic<bool> audioRunning_{false};
+    std::atomic<bool> metaRunning_{false};
+};

@@ -1,0 +1,120 @@
+// BaseProcess: the module framework's process skeleton that a module process derives from.
+//
+// Lifecycle (one thread, the "message thread", calls these in order):
+//   constructor  reads the framework's log options so that the first log line already goes
+//                where the user asked;
+//   Initialize() reads the framework's options, calls initializeProcess (the module's own
+//                options come first), opens the status output, then prepares the host; false
+//                if any step fails;
+//   Execute()    startProcess, then the host's Run (connection reply, credentials, samples),
+//                then the disconnection request and stopProcess;
+//   Uninitialize().
+// Hooks are virtual and public so that a host (and a test) can deliver messages. The sample
+// hooks are called on the host's receive threads, concurrently with the message hooks.
+// Status and send calls are safe for concurrent callers.
+#pragma once
+
+#include <map>
+#include <memory>
+#include <mutex>
+#include <string>
+
+#include "platform/framework/FrameworkOptions.h"
+#include "platform/framework/ModuleHost.h"
+#include "platform/framework/ReceivedSample.h"
+#include "platform/framework/StatusWriter.h"
+#include "platform/framework/VqMessages.h"
+#include "platform/framework/VqResult.h"
+
+class IVqModuleMessageObserver {
+public:
+    virtual ~IVqModuleMessageObserver() = default;
+};
+
+class IReceiveStreamObserver {
+public:
+    virtual ~IReceiveStreamObserver() = default;
+    virtual void notifyVideoData(std::shared_ptr<ReceivedSample> sample) = 0;
+    virtual void notifyAudioData(std::shared_ptr<ReceivedSample> sample) = 0;
+    virtual void notifyMetaData(std::shared_ptr<ReceivedSample> sample) = 0;
+};
+
+class ISendStreamObserver {
+public:
+    virtual ~ISendStreamObserver() = default;
+};
+
+class IStreamDataSender {
+public:
+    virtual ~IStreamDataSender() = default;
+};
+
+class BaseProcess : public IVqModuleMessageObserver,
+                    public IReceiveStreamObserver,
+                    public ISendStreamObserver,
+                    public IStreamDataSender {
+public:
+    BaseProcess(int argc, char** argv, bool, bool);
+    ~BaseProcess() override;
+    BaseProcess(const BaseProcess&) = delete;
+    BaseProcess& operator=(const BaseProcess&) = delete;
+
+    bool Initialize();
+    bool Execute();
+    void Uninitialize();
+
+    // Installs the host that Initialize prepares and Execute runs; without one, Initialize
+    // creates the media host for -input (CreateMediaHost). Call before Initialize.
+    void SetHost(std::shared_ptr<IModuleHost> host);
+
+    // `-name value` readers. GetArgument_int: false when the value is not a whole number in
+    // int range; the two trailing parameters (minimum digits, base) are accepted and ignored.
+    bool GetArgument_str(std::string name, std::string& value, std::string defaultValue);
+    bool GetArgument_int(std::string name, int& value, int, int);
+    std::string GetStreamingId();
+    std::string getParentStreamName();
+    const FrameworkOptions& Options() const { return options_; }
+
+    void SetProcessStatus(VqProcessState state, unsigned int code);
+    VqProcessState GetProcessStatus();
+    unsigned int GetProcessStatusCode();
+
+    VqResult SendTransmissionStatus(const std::string& destination, TransferStatusNotify& message);
+    VqResult SendGetAWSTokenRequest(const std::string& destination,
+                                    GetAWSSecureTokenRequest& message);
+    VqResult SendLastSequenceNumNotify(const std::string& destination,
+                                       LastSequenceNumNotify& message);
+
+    // Message hooks (message thread).
+    virtual VqResult notifyModuleConnectionRequestReply(ConnectResponse& reply);
+    virtual VqResult notifyInputOutputDisconnectionRequest(DisconnectInputRequest& request);
+    virtual VqResult notifyGetAWSTokenRequest(GetAWSSecureTokenRequest& request);
+    virtual VqResult notifyLastSequenceNumNotify(LastSequenceNumNotify& message);
+    virtual VqResult notifyTransmissionStatus(TransferStatusNotify& message);
+    virtual bool initializeProcess(std::string parameter);
+    virtual void stopProcess();
+    virtual bool startProcess();
+    virtual bool setProperties(std::map<std::string, std::string>& properties);
+
+    // Sample hooks (receive threads): the base drops the samples.
+    void notifyVideoData(std::shared_ptr<ReceivedSample>) override {}
+    void notifyAudioData(std::shared_ptr<ReceivedSample>) override {}
+    void notifyMetaData(std::shared_ptr<ReceivedSample>) override {}
+
+private:
+    std::shared_ptr<IModuleHost> hostSnapshot();
+
+    CommandLine commandLine_;
+    FrameworkOptions options_;
+    std::vector<std::string> optionErrors_;  // framework options that could not be read
+    StatusWriter status_;
+
+    std::mutex mutex_;  // guards host_, state_, code_
+    std::shared_ptr<IModuleHost> host_;
+    VqProcessState state_ = Initializing;
+    unsigned int code_ = 0;
+};
+
+// Creates the host that records `options.input`; null (with a log line saying why) when the
+// input cannot be handled by this build.
+std::shared_ptr<IModuleHost> CreateMediaHost(const FrameworkOptions& options);

@@ -1,0 +1,84 @@
+// FileRecorderModule: the recorder's module. Wires the pipeline when the host confirms the
+// connection (TimeManager, FileBuffer, DataUploader, NalAnalyzer, StreamBuffer,
+// DataController), routes the samples its three workers hand it to the stream buffer, and
+// holds video and audio back until filing starts: after the first sample and then the start
+// ignore time.
+//
+// Threads: Connect, Disconnect, OnStart, OnStop on the message thread (never concurrently);
+// Process* on the three media workers; WaitForStart on the start thread; SetAwsInfo and
+// StopStreamBuffer on the message or upload thread. `mutex_` guards the three gate flags;
+// `componentsMutex_` guards the component pointers that other threads read.
+#pragma once
+
+#include <boost/thread/condition_variable.hpp>
+#include <boost/thread/mutex.hpp>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <thread>
+
+#include "modulebase/Module.h"
+#include "src/AwsInfo.h"
+#include "src/IDataController.h"
+#include "src/IDataUploader.h"
+#include "src/IFileBuffer.h"
+#include "src/INalAnalyzer.h"
+#include "src/IStreamBuffer.h"
+#include "src/ITimeManager.h"
+#include "src/ModuleSettings.h"
+
+namespace Orvane {
+
+class ProcessControl;
+
+class FileRecorderModule : public Module {
+public:
+    FileRecorderModule();
+    ~FileRecorderModule() override;
+
+    bool OnInitialize(std::shared_ptr<void> parameter) override;
+    void OnStop() override;
+    void OnStart() override;
+    void ProcessVideo(std::shared_ptr<StreamData> sample) override;
+    void ProcessAudio(std::shared_ptr<StreamData> sample) override;
+    void ProcessMeta(std::shared_ptr<StreamData> sample) override;
+
+    // Creates and starts the pipeline. A reply while connected is refused with a log line:
+    // running components are never replaced.
+    void Connect(ProcessControl* processControl, ModuleSettings settings);
+    // Ends the start thread, then stops the stream buffer and the data controller. A second
+    // call does nothing.
+    void Disconnect();
+
+    // Hands credentials to the data controller; before Connect they are kept and handed over
+    // when the controller is created.
+    void SetAwsInfo(const AwsInfo& info);
+    // Stops the stream buffer (module error path); no-op before Connect.
+    void StopStreamBuffer();
+
+private:
+    bool IsWaitingForStart();
+    void WaitForStart();
+    std::shared_ptr<IStreamBuffer> streamBuffer() const;
+
+    ProcessControl* processControl_ = nullptr;  // not owned
+    std::shared_ptr<IDataController> dataController_;
+    std::shared_ptr<IStreamBuffer> streamBuffer_;
+    std::shared_ptr<IFileBuffer> fileBuffer_;
+    std::shared_ptr<ITimeManager> timeManager_;
+    std::shared_ptr<IDataUploader> dataUploader_;
+    std::shared_ptr<INalAnalyzer> nalAnalyzer_;
+    bool filing_ = false;         // the start thread opened the gate
+    bool dataReceived_ = false;   // event: a sample found the gate closed
+    bool stopRequested_ = false;  // set by Disconnect
+    boost::mutex mutex_;          // guards the three flags above
+    boost::condition_variable condition_;  // the start thread waits on it
+    std::shared_ptr<std::thread> startThread_;
+    ModuleSettings settings_;
+
+    mutable std::mutex componentsMutex_;  // guards the component pointers and pendingAwsInfo_
+    std::optional<AwsInfo> pendingAwsInfo_;  // credentials that came before Connect
+    bool connected_ = false;  // between Connect and Disconnect (message thread)
+};
+
+}  // namespace Orvane

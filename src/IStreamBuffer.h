@@ -1,0 +1,27 @@
+// IStreamBuffer: gathers the samples into GOPs and cuts them into stream files on a filing
+// thread of its own.
+//
+// Start/Stop: the connecting/disconnecting thread (Stop also from notifyModuleError on the
+// upload thread). Receive*: one media worker each, concurrently.
+#pragma once
+
+#include <memory>
+
+#include "platform/framework/StreamData.h"
+
+namespace Orvane {
+
+class IStreamBuffer {
+public:
+    virtual void Start() = 0;
+    // Ends and joins the filing thread; safe to call again and from two threads at once.
+    virtual void Stop() = 0;
+    virtual void ReceiveVideo(std::shared_ptr<StreamData> sample) = 0;
+    virtual void ReceiveAudio(std::shared_ptr<StreamData> sample) = 0;
+    virtual void ReceiveMeta(std::shared_ptr<StreamData> sample) = 0;
+    // Meta before filing starts: kept in a sliding window, does not start the filing thread.
+    virtual void ReceiveMetaBeforeStart(std::shared_ptr<StreamData> sample) = 0;
+    virtual ~IStreamBuffer() = default;
+};
+
+}  // namespace Orvane

@@ -1,0 +1,51 @@
+// Helpers shared by the tests: samples, waits with deadlines, child processes, media clips.
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "platform/framework/ReceivedSample.h"
+#include "platform/framework/StreamData.h"
+
+namespace testsupport {
+
+// Waits until `predicate` holds, checking every few milliseconds; false at the deadline.
+bool WaitUntil(const std::function<bool()>& predicate, int timeoutMs = 10000);
+
+// Minimal H.264 / H.265 access units in Annex B (4-byte start codes): parameter sets then a
+// slice header. `bytes` pads the slice to roughly that size.
+std::string H264Idr(size_t bytes = 64);
+std::string H264NonIdr(size_t bytes = 32);
+std::string H265Idr(size_t bytes = 64);
+std::string H265NonIdr(size_t bytes = 32);
+
+// A ReceivedSample/StreamData with the given times and payload (owned by the sample).
+std::shared_ptr<ReceivedSample> MakeReceived(uint64_t timestamp, uint64_t rtpTime,
+                                             std::string payload);
+std::shared_ptr<StreamData> MakeSample(uint64_t timestamp, uint64_t rtpTime = 0,
+                                       std::string payload = "x");
+std::shared_ptr<StreamData> MakeVideo(uint64_t timestamp, bool idr);
+
+struct ProcessResult {
+    int exitStatus = -1;   // exit code, or -1 when killed by a signal
+    int signal = 0;        // terminating signal, 0 if exited
+    std::string output;    // stdout and stderr together
+};
+// Runs argv[0] with the arguments (no shell), waits at most `timeoutMs`.
+ProcessResult RunProcess(const std::vector<std::string>& argv, int timeoutMs = 60000);
+
+// Path of a file in the build tree (SFR_BINARY_DIR/relative).
+std::string BuildPath(const std::string& relative);
+
+// Makes (once, cached in the build tree) a media clip with the ffmpeg CLI:
+// `ffmpeg -y -v error <args> <path>`. Returns its path; empty on failure.
+std::string MediaClip(const std::string& fileName, const std::vector<std::string>& args);
+
+// Reads a whole file; empty when it cannot be read.
+std::string ReadFile(const std::string& path);
+
+}  // namespace testsupport
