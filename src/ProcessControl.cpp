@@ -67,9 +67,7 @@ bool ProcessControl::initializeProcess(std::string) {
                     "initializeProcess while the module runs: the running module is kept.");
         return false;
     }
-    ModuleSettings settings;
-    if (!getArgument(settings)) return false;
-    settings_ = settings;
+    if (!getArgument(settings_)) return false;
     streamingId_ = settings_.streamingId;
     if (module_) module_->OnStop();  // a stopped module may still have a connected pipeline
     module_ = std::make_shared<FileRecorderModule>();

@@ -2,6 +2,7 @@
 
 #include <cerrno>
 #include <climits>
+#include <cctype>
 #include <cmath>
 #include <cstdlib>
 #include <mutex>
@@ -25,6 +26,8 @@ bool CommandLine::Find(const std::string& name, std::string& value) const {
 
 bool CommandLine::ParseInt(const std::string& text, int& value) {
     if (text.empty() || text.size() > 64) return false;
+    if (!std::isdigit(static_cast<unsigned char>(text[0])) && text[0] != '-' && text[0] != '+')
+        return false;  // strtoll would skip leading blanks
     errno = 0;
     char* end = nullptr;
     long long parsed = std::strtoll(text.c_str(), &end, 10);

@@ -1,0 +1,192 @@
+#include "platform/nal/StreamAnalyzer.h"
+
+extern "C" {
+#include <libavformat/avformat.h>
+}
+
+#include <gtest/gtest.h>
+
+#include <random>
+#include <string>
+#include <vector>
+
+#include "platform/framework/StreamData.h"
+#include "src/NalAnalyzer.h"
+#include "tests/support/TestSupport.h"
+
+using nal_access::StreamAnalyzer;
+
+namespace {
+
+// Access units of a raw Annex B elementary stream, as FFmpeg's parser splits them.
+std::vector<std::string> accessUnits(const std::string& path) {
+    std::vector<std::string> units;
+    AVFormatContext* ctx = nullptr;
+    if (avformat_open_input(&ctx, path.c_str(), nullptr, nullptr) < 0) return units;
+    AVPacket* pkt = av_packet_alloc();
+    while (av_read_frame(ctx, pkt) >= 0) {
+        units.emplace_back(reinterpret_cast<const char*>(pkt->data), pkt->size);
+        av_packet_unref(pkt);
+    }
+    av_packet_free(&pkt);
+    avformat_close_input(&ctx);
+    return units;
+}
+
+std::vector<std::string> h264Units() {
+    static std::vector<std::string> units = accessUnits(testsupport::MediaClip(
+        "analyzer.h264", {"-f", "lavfi", "-i", "testsrc2=size=128x96:rate=10:duration=1", "-c:v",
+                          "libx264", "-preset", "ultrafast", "-g", "5", "-keyint_min", "5",
+                          "-sc_threshold", "0", "-bf", "0", "-f", "h264"}));
+    return units;
+}
+
+std::vector<std::string> h265Units(bool openGop) {
+    std::string params = std::string("keyint=5:min-keyint=5:scenecut=0:bframes=0:log-level=error:") +
+                         (openGop ? "open-gop=1" : "open-gop=0");
+    return accessUnits(testsupport::MediaClip(
+        openGop ? "analyzer-cra.hevc" : "analyzer-idr.hevc",
+        {"-f", "lavfi", "-i", "testsrc2=size=128x96:rate=10:duration=1", "-c:v", "libx265",
+         "-x265-params", params, "-f", "hevc"}));
+}
+
+bool h264(const std::string& au) {
+    return StreamAnalyzer::IsIdrH264(reinterpret_cast<const uint8_t*>(au.data()), au.size());
+}
+bool h265(const std::string& au) {
+    return StreamAnalyzer::IsIdrH265(reinterpret_cast<const uint8_t*>(au.data()), au.size());
+}
+
+// Splits an Annex B unit at its start codes into NAL units.
+std::vector<std::string> nalUnits(const std::string& au) {
+    std::vector<std::string> nals;
+    size_t i = 0, start = std::string::npos;
+    while (i + 3 <= au.size()) {
+        if (au[i] == 0 && au[i + 1] == 0 && au[i + 2] == 1) {
+            if (start != std::string::npos) {
+                size_t end = i;
+                while (end > start && au[end - 1] == 0) --end;
+                nals.push_back(au.substr(start, end - start));
+            }
+            start = i + 3;
+            i += 3;
+        } else {
+            ++i;
+        }
+    }
+    if (start != std::string::npos) nals.push_back(au.substr(start));
+    return nals;
+}
+
+std::string withStartCodes(const std::vector<std::string>& nals, size_t codeBytes) {
+    std::string out;
+    for (const auto& n : nals) out += std::string(codeBytes - 1, '\0') + '\1' + n;
+    return out;
+}
+
+std::string lengthPrefixed(const std::vector<std::string>& nals) {
+    std::string out;
+    for (const auto& n : nals) {
+        uint32_t len = static_cast<uint32_t>(n.size());
+        out += static_cast<char>(len >> 24);
+        out += static_cast<char>(len >> 16);
+        out += static_cast<char>(len >> 8);
+        out += static_cast<char>(len);
+        out += n;
+    }
+    return out;
+}
+
+}  // namespace
+
+TEST(StreamAnalyzerH264, RealStreamHasIdrEveryFifthAccessUnit) {
+    auto units = h264Units();
+    ASSERT_EQ(units.size(), 10u);
+    for (size_t i = 0; i < units.size(); ++i) EXPECT_EQ(h264(units[i]), i % 5 == 0) << "unit " << i;
+}
+
+TEST(StreamAnalyzerH264, FramingDoesNotChangeTheAnswer) {
+    auto units = h264Units();
+    ASSERT_GE(units.size(), 2u);
+    for (size_t i : {0u, 1u}) {
+        auto nals = nalUnits(units[i]);
+        bool idr = i == 0;
+        EXPECT_EQ(h264(withStartCodes(nals, 3)), idr);
+        EXPECT_EQ(h264(withStartCodes(nals, 4)), idr);
+        EXPECT_EQ(h264(lengthPrefixed(nals)), idr);
+    }
+}
+
+TEST(StreamAnalyzerH265, IdrIsRecognisedAndCraIsNot) {
+    auto idr = h265Units(false);
+    ASSERT_EQ(idr.size(), 10u);
+    for (size_t i = 0; i < idr.size(); ++i) EXPECT_EQ(h265(idr[i]), i % 5 == 0) << "unit " << i;
+
+    auto cra = h265Units(true);
+    ASSERT_EQ(cra.size(), 10u);
+    EXPECT_TRUE(h265(cra[0]));  // the stream opens with an IDR
+    EXPECT_FALSE(h265(cra[5]));  // a later key frame is a CRA picture
+    EXPECT_EQ(h265(lengthPrefixed(nalUnits(idr[0]))), true);
+    EXPECT_EQ(h265(withStartCodes(nalUnits(idr[0]), 3)), true);
+}
+
+TEST(StreamAnalyzerH265, H264RulesDoNotApplyToH265AndViceVersa) {
+    EXPECT_FALSE(h264(h265Units(false)[1]));
+    EXPECT_FALSE(h265(h264Units()[1]));
+}
+
+TEST(StreamAnalyzerBadInput, TruncatedOrRandomBytesGiveFalseWithoutOverread) {
+    auto idr = h264Units()[0];
+    // Every prefix of a real IDR unit, each in its own exactly-sized heap block so that ASan
+    // sees any read past the end. Prefixes that still hold the slice header may say true.
+    auto nals = nalUnits(idr);
+    size_t sliceStart = idr.find(std::string("\x00\x00\x01\x65", 4));
+    ASSERT_NE(sliceStart, std::string::npos);
+    for (size_t n = 0; n <= idr.size(); ++n) {
+        std::vector<uint8_t> prefix(idr.begin(), idr.begin() + static_cast<long>(n));
+        bool result = StreamAnalyzer::IsIdrH264(prefix.data(), prefix.size());
+        if (n <= sliceStart + 3) {
+            EXPECT_FALSE(result) << "prefix " << n;
+        }
+        StreamAnalyzer::IsIdrH265(prefix.data(), prefix.size());
+    }
+    auto lp = lengthPrefixed(nals);
+    for (size_t n = 0; n < lp.size(); ++n) {
+        std::vector<uint8_t> prefix(lp.begin(), lp.begin() + static_cast<long>(n));
+        StreamAnalyzer::IsIdrH264(prefix.data(), prefix.size());
+    }
+    std::mt19937 rng(1234);
+    for (int round = 0; round < 20000; ++round) {
+        std::vector<uint8_t> bytes(rng() % 64);
+        for (auto& b : bytes) b = static_cast<uint8_t>(rng() % 4 == 0 ? 0 : rng());
+        StreamAnalyzer::IsIdrH264(bytes.data(), bytes.size());
+        StreamAnalyzer::IsIdrH265(bytes.data(), bytes.size());
+    }
+    EXPECT_FALSE(StreamAnalyzer::IsIdrH264(nullptr, 0));
+    // A length prefix larger than the payload.
+    std::string lying("\x00\x00\x10\x00\x65\x88", 6);
+    EXPECT_FALSE(h264(lying));
+}
+
+TEST(StreamAnalyzerOnSamples, ReadsThePayloadThroughTheSampleAndHandlesMarkers) {
+    StreamAnalyzer analyzer;
+    EXPECT_TRUE(analyzer.IsIDR(testsupport::MakeSample(0, 0, testsupport::H264Idr())));
+    EXPECT_FALSE(analyzer.IsIDR(testsupport::MakeSample(0, 0, testsupport::H264NonIdr())));
+    EXPECT_TRUE(analyzer.IsIDR_H265(testsupport::MakeSample(0, 0, testsupport::H265Idr())));
+    EXPECT_FALSE(analyzer.IsIDR_H265(testsupport::MakeSample(0, 0, testsupport::H265NonIdr())));
+    EXPECT_FALSE(analyzer.IsIDR(std::make_shared<StreamData>()));
+    EXPECT_FALSE(analyzer.IsIDR(nullptr));
+}
+
+TEST(NalAnalyzerCodecChoice, CodecTypeOneSelectsH265AnyOtherH264) {
+    auto h264Idr = testsupport::MakeSample(0, 0, testsupport::H264Idr());
+    auto h265Idr = testsupport::MakeSample(0, 0, testsupport::H265Idr());
+    Orvane::NalAnalyzer hevc(1);
+    EXPECT_TRUE(hevc.IsIDR(h265Idr));
+    EXPECT_FALSE(hevc.IsIDR(h264Idr));
+    for (int type : {0, 2, -1}) {
+        Orvane::NalAnalyzer avc(type);
+        EXPECT_TRUE(avc.IsIDR(h264Idr)) << type;
+        EXPECT_FALSE(avc.IsIDR(h265Idr)) << type;
+    }
+}
