@@ -1,0 +1,282 @@
+#include "src/DataController.h"
+
+#include <boost/chrono.hpp>
+
+#include "platform/logger/Logger.h"
+
+namespace Orvane {
+namespace {
+constexpr const char* kFile = "src/DataController";
+
+boost::chrono::steady_clock::time_point deadlineAfterMs(int64_t ms) {
+    return boost::chrono::steady_clock::now() + boost::chrono::milliseconds(ms);
+}
+}  // namespace
+
+DataController::DataController(INotifyObserver* observer, std::shared_ptr<IFileBuffer> fileBuffer,
+                               std::shared_ptr<ITimeManager> timeManager,
+                               std::shared_ptr<IDataUploader> uploader, ModuleSettings settings)
+    : observer_(observer),
+      fileBuffer_(std::move(fileBuffer)),
+      timeManager_(std::move(timeManager)),
+      uploader_(std::move(uploader)),
+      settings_(std::move(settings)) {
+    resultNames_ = {
+        {static_cast<int32_t>(Success), "Success"},
+        {static_cast<int32_t>(TimeOut), "TimeOut"},
+        {static_cast<int32_t>(AuthenticationError), "AuthenticationError"},
+        {static_cast<int32_t>(FilePathError), "FilePathError"},
+        {static_cast<int32_t>(FileBroken), "FileBroken"},
+        {static_cast<int32_t>(NetworkError), "NetworkError"},
+        {static_cast<int32_t>(RequestTimeTooSkewed), "RequestTimeTooSkewed"},
+        {static_cast<int32_t>(InternalError), "InternalError"},
+        {static_cast<int32_t>(OtherError), "OtherError"},
+    };
+    warningCodes_ = {
+        {"TimeOut", 22},      {"AuthenticationError", 23}, {"FilePathError", 24},
+        {"FileBroken", 25},   {"NetworkError", 26},        {"RequestTimeTooSkewed", 27},
+        {"InternalError", 28},
+    };
+}
+
+DataController::~DataController() {
+    if (uploadThread_.joinable() && uploadThread_.get_id() != std::this_thread::get_id()) Stop();
+}
+
+void DataController::Start() {
+    constexpr const char* fn = "Orvane::DataController::Start";
+    Logger::Put(11, kFile, fn, __LINE__, "Start enter.");
+    {
+        boost::lock_guard<boost::mutex> lock(mutex_);
+        stop_ = false;
+    }
+    uploadThread_ = std::thread(&DataController::fileUpload, this);
+    Logger::Put(11, kFile, fn, __LINE__, "Start exit.");
+}
+
+void DataController::Stop() {
+    constexpr const char* fn = "Orvane::DataController::Stop";
+    Logger::Put(11, kFile, fn, __LINE__, "Stop enter.");
+    {
+        boost::lock_guard<boost::mutex> lock(mutex_);
+        stop_ = true;
+    }
+    {
+        std::lock_guard<std::mutex> stopLock(stopMutex_);
+        if (uploadThread_.joinable()) {
+            uploader_->Cancel();
+            fileDurationCondition_.notify_one();
+            credentialsCondition_.notify_one();
+            fileBuffer_->Push(VqStreamFileData());  // wakes a Pop that waits for a file
+            uploadThread_.join();
+        }
+    }
+    Logger::Put(11, kFile, fn, __LINE__, "Stop exit.");
+}
+
+void DataController::SetAwsInfo(AwsInfo info) {
+    constexpr const char* fn = "Orvane::DataController::SetAwsInfo";
+    Logger::Put(12, kFile, fn, __LINE__, "SetAwsInfo enter.");
+    {
+        boost::lock_guard<boost::mutex> lock(mutex_);
+        credentials_ = std::move(info);
+        credentialsReceived_ = true;
+    }
+    credentialsCondition_.notify_one();
+    Logger::Put(12, kFile, fn, __LINE__, "SetAwsInfo exit.");
+}
+
+bool DataController::stopped() {
+    boost::lock_guard<boost::mutex> lock(mutex_);
+    return stop_;
+}
+
+std::string DataController::resultName(FileTransferResult result) const {
+    auto it = resultNames_.find(static_cast<int32_t>(result));
+    return it == resultNames_.end() ? std::string("Unknown") : it->second;
+}
+
+void DataController::fileUpload() {
+    constexpr const char* fn = "Orvane::DataController::fileUpload";
+    Logger::Put(11, kFile, fn, __LINE__, "fileUpload enter.");
+    int32_t sequenceNumber = 1;
+    while (!stopped()) {
+        FileTransferRequest request = PopStreamFile(sequenceNumber);
+        if (stopped()) break;
+
+        const uint32_t duration = request.duration;
+        bool succeeded = false;
+        std::string errorName;
+        FileTransferInfo info;  // zero: file size 0, response time 0
+        FileTransferResult result = Success;
+        bool attempt = !stopped();
+        while (attempt) {
+            if (uint64_t count = fileBuffer_->GetBufferCount(); count != 0) {
+                Logger::Put(11, nullptr, nullptr, 0, "ST: Buffer Count : %llu",
+                            static_cast<unsigned long long>(count));
+            }
+            bool haveCredentials;
+            {
+                boost::lock_guard<boost::mutex> lock(mutex_);
+                haveCredentials = credentialsReceived_;
+            }
+            result = haveCredentials ? uploader_->Upload(request, &info) : AuthenticationError;
+
+            if (result == Success) {
+                Logger::Put(13, kFile, fn, __LINE__, "FileTransferResult Success.");
+                consecutiveAuthErrors_ = 0;
+                if (observer_ != nullptr && observer_->GetModuleStatus() == Warning) {
+                    observer_->notifyModuleExecute();
+                }
+                succeeded = true;
+                break;
+            }
+            if (result == UploaderDisabled) {
+                Logger::Put(11, nullptr, nullptr, 0, "ST: File Uploader is Disabled.");
+                break;
+            }
+            if (result == OtherError) {
+                Logger::Put(4, kFile, fn, __LINE__, "Other Error.");
+                if (observer_ != nullptr) observer_->notifyModuleError(21);
+                boost::lock_guard<boost::mutex> lock(mutex_);
+                stop_ = true;
+                break;
+            }
+            if (result == AuthenticationError) {
+                Logger::Put(11, nullptr, nullptr, 0, "ST: Authentication Error.");
+                {
+                    boost::lock_guard<boost::mutex> lock(mutex_);
+                    credentialsReceived_ = false;
+                }
+                ++consecutiveAuthErrors_;
+                GetAWSSecureTokenRequest tokenRequest;
+                if (observer_ != nullptr) observer_->notifyGetAWSTokenRequest(tokenRequest);
+                if (waitAuthenticationInfo()) {
+                    boost::lock_guard<boost::mutex> lock(mutex_);
+                    request.accessKey = credentials_.accessKey;
+                    request.secretKey = credentials_.secretKey;
+                    request.sessionToken = credentials_.sessionToken;
+                    request.region = credentials_.region;
+                }
+            } else if (result == NetworkError) {
+                Logger::Put(11, nullptr, nullptr, 0, "ST: Network Error.");
+                waitForFileDuration();
+            }
+            // Every other result is retried at once.
+
+            if (fileBuffer_->IsBufferFull()) {
+                errorName = resultName(result);
+                if (!(errorName == "AuthenticationError" && consecutiveAuthErrors_ < 2) &&
+                    observer_ != nullptr) {
+                    auto code = warningCodes_.find(errorName);
+                    observer_->notifyModuleWarn(
+                        code == warningCodes_.end() ? 0u : static_cast<unsigned>(code->second));
+                }
+                break;
+            }
+            attempt = !stopped();
+        }
+
+        const bool stopNow = stopped();
+        if (!stopNow || succeeded) {
+            notifySequence(sequenceNumber, succeeded, errorName, duration);
+            notifyUploadInfo(sequenceNumber, info, result);
+            ++sequenceNumber;
+            if (!stopNow) deleteOverFileBuffer(sequenceNumber);
+        }
+        // `request` (and with it the file's samples) is released here.
+    }
+    Logger::Put(11, kFile, fn, __LINE__, "fileUpload exit.");
+}
+
+FileTransferRequest DataController::PopStreamFile(int32_t sequenceNumber) {
+    VqStreamFileData record = fileBuffer_->Pop();
+    Logger::Put(12, nullptr, nullptr, 0, "ST: PopStreamFile.");
+    FileTransferRequest request;
+    request.streamingId = settings_.streamingId;
+    request.sequenceNumber = sequenceNumber;
+    request.bucketName = settings_.bucketName;
+    {
+        boost::lock_guard<boost::mutex> lock(mutex_);
+        request.accessKey = credentials_.accessKey;
+        request.secretKey = credentials_.secretKey;
+        request.sessionToken = credentials_.sessionToken;
+        request.region = credentials_.region;
+    }
+    request.s3Accel = settings_.s3Accel;
+    request.duration = record.duration;
+    // The record is ours alone: its samples move into the request (payloads stay shared).
+    request.video = std::move(record.video);
+    request.audio = std::move(record.audio);
+    request.meta = std::move(record.meta);
+    return request;
+}
+
+bool DataController::waitAuthenticationInfo() {
+    constexpr const char* fn = "Orvane::DataController::waitAuthenticationInfo";
+    Logger::Put(11, kFile, fn, __LINE__, "waitAuthInfo.");
+    boost::unique_lock<boost::mutex> lock(mutex_);
+    auto deadline = deadlineAfterMs(settings_.authRetryTime);
+    while (!stop_ && !credentialsReceived_) {
+        if (credentialsCondition_.wait_until(lock, deadline) == boost::cv_status::timeout) break;
+    }
+    if (credentialsReceived_) {
+        Logger::Put(11, kFile, fn, __LINE__, "Received Authentication Info.");
+        return true;
+    }
+    if (stop_) {
+        Logger::Put(11, kFile, fn, __LINE__, "end.");
+    } else {
+        Logger::Put(5, kFile, fn, __LINE__, "Not Received Authentication Info.");
+    }
+    return false;
+}
+
+void DataController::waitForFileDuration() {
+    constexpr const char* fn = "Orvane::DataController::waitForFileDuration";
+    Logger::Put(11, kFile, fn, __LINE__, "wait enter.");
+    boost::unique_lock<boost::mutex> lock(mutex_);
+    auto deadline = deadlineAfterMs(int64_t{settings_.uploadInterval} * 1000);
+    while (!stop_) {
+        if (fileDurationCondition_.wait_until(lock, deadline) == boost::cv_status::timeout) break;
+    }
+    Logger::Put(11, kFile, fn, __LINE__, "wait exit.");
+}
+
+void DataController::deleteOverFileBuffer(int32_t& sequenceNumber) {
+    constexpr const char* fn = "Orvane::DataController::deleteOverFileBuffer";
+    while (fileBuffer_->IsBufferFull()) {
+        VqStreamFileData record = fileBuffer_->Pop();
+        Logger::Put(11, kFile, fn, __LINE__, "delete buffer : %d. Buffer Count : %llu.",
+                    sequenceNumber, static_cast<unsigned long long>(fileBuffer_->GetBufferCount()));
+        notifySequence(sequenceNumber, false, "BufferOver", record.duration);
+        notifyUploadInfo(sequenceNumber, FileTransferInfo(), OtherError);
+        ++sequenceNumber;
+    }
+}
+
+void DataController::notifySequence(int32_t sequenceNumber, bool succeeded,
+                                    const std::string& errorName, uint32_t duration) {
+    if (observer_ == nullptr) return;
+    LastSequenceNumNotify message;
+    SequenceEntry entry;
+    entry.streamingId = settings_.streamingId;
+    entry.sequenceNumber = static_cast<uint32_t>(sequenceNumber);
+    entry.succeeded = succeeded;
+    entry.errorName = errorName;
+    entry.flag = false;
+    entry.duration = duration;
+    message.entries.push_back(std::move(entry));
+    observer_->notifyLastSequenceNumNotify(message);
+}
+
+void DataController::notifyUploadInfo(int sequenceNumber, const FileTransferInfo& info,
+                                      FileTransferResult result) {
+    std::string line = "FileIndex, " + std::to_string(sequenceNumber) + ", ErrorCode, " +
+                       resultName(result) + ", ResponseTime, " + std::to_string(info.responseTime) +
+                       ", FileSize, " + std::to_string(info.fileSize) + ", BufferCount, " +
+                       std::to_string(fileBuffer_->GetBufferCount());
+    if (observer_ != nullptr) observer_->notifyTransmissionStatus({{"UploadInfo", line}});
+}
+
+}  // namespace Orvane
