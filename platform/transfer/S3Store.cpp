@@ -1,0 +1,484 @@
+#include "platform/transfer/S3Store.h"
+
+#include <curl/curl.h>
+
+#include <cctype>
+#include <cstring>
+#include <mutex>
+#include <utility>
+#include <vector>
+
+#include "platform/logger/Logger.h"
+#include "platform/transfer/Digest.h"
+#include "platform/transfer/S3Response.h"
+
+namespace {
+
+const char kFile[] = "platform/transfer/S3Store";
+const size_t kMaxBodyKept = 64 * 1024;  // error documents are a few hundred bytes
+const int kMaxWaitMs = 1000;  // upper bound of one curl_multi_poll; curl's timers cut it shorter
+
+std::string Lower(std::string text) {
+    for (char& c : text) c = static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
+    return text;
+}
+
+// Header values must not carry line breaks (they would add headers of their own) and are
+// signed in canonical form: keep printable ASCII only, runs of spaces folded, no spaces at
+// the ends, so that every server's canonical form equals what was sent.
+std::string HeaderValue(const std::string& value) {
+    std::string out;
+    bool pendingSpace = false;
+    for (unsigned char c : value) {
+        if (c == ' ' || c == '\t') {
+            pendingSpace = !out.empty();
+            continue;
+        }
+        if (pendingSpace) out.push_back(' ');
+        pendingSpace = false;
+        out.push_back(c >= 0x21 && c < 0x7f ? static_cast<char>(c) : '_');
+    }
+    return out;
+}
+
+// A metadata name as an HTTP token: lower case letters, digits, '-' and '_'.
+std::string MetadataName(const std::string& name) {
+    std::string out = Lower(name);
+    for (char& c : out) {
+        if (!std::isalnum(static_cast<unsigned char>(c)) && c != '-' && c != '_') c = '-';
+    }
+    return out;
+}
+
+// Host names S3 can serve a bucket or region under (lower case, digits, '.', '-').
+bool HostLabelChars(const std::string& text) {
+    if (text.empty()) return false;
+    for (unsigned char c : text) {
+        if (!(std::islower(c) || std::isdigit(c) || c == '.' || c == '-')) return false;
+    }
+    return true;
+}
+
+// Replaces every occurrence of the secrets in a text that is about to be logged.
+std::string Redact(std::string text, const std::vector<std::string>& secrets) {
+    for (const auto& secret : secrets) {
+        if (secret.size() < 4) continue;
+        for (size_t at = text.find(secret); at != std::string::npos;
+             at = text.find(secret, at + 3)) {
+            text.replace(at, secret.size(), "***");
+        }
+    }
+    return text;
+}
+
+struct Body {
+    const uint8_t* data = nullptr;
+    size_t size = 0;
+    size_t offset = 0;  // bytes handed to curl so far
+};
+
+size_t ReadBody(char* buffer, size_t size, size_t count, void* user) {
+    auto* body = static_cast<Body*>(user);
+    size_t n = std::min(size * count, body->size - body->offset);
+    if (n > 0) std::memcpy(buffer, body->data + body->offset, n);
+    body->offset += n;
+    return n;
+}
+
+// curl rewinds when it must send the body again (a reused connection that was closed).
+int SeekBody(void* user, curl_off_t offset, int origin) {
+    auto* body = static_cast<Body*>(user);
+    if (origin != SEEK_SET || offset < 0 || static_cast<size_t>(offset) > body->size) {
+        return CURL_SEEKFUNC_CANTSEEK;
+    }
+    body->offset = static_cast<size_t>(offset);
+    return CURL_SEEKFUNC_OK;
+}
+
+size_t KeepBody(char* data, size_t size, size_t count, void* user) {
+    auto* response = static_cast<S3Response*>(user);
+    size_t n = size * count;
+    if (response->body.size() < kMaxBodyKept) {
+        response->body.append(data, std::min(n, kMaxBodyKept - response->body.size()));
+    }
+    return n;
+}
+
+size_t KeepHeader(char* data, size_t size, size_t count, void* user) {
+    auto* response = static_cast<S3Response*>(user);
+    size_t n = size * count;
+    std::string line(data, n);
+    while (!line.empty() && (line.back() == '\r' || line.back() == '\n')) line.pop_back();
+    if (line.compare(0, 5, "HTTP/") == 0) {
+        // A new answer begins (the one after a 100 Continue): forget the earlier headers.
+        *response = S3Response{};
+        return n;
+    }
+    size_t colon = line.find(':');
+    if (colon == std::string::npos) return n;
+    std::string name = Lower(line.substr(0, colon));
+    size_t start = line.find_first_not_of(" \t", colon + 1);
+    std::string value = start == std::string::npos ? "" : line.substr(start);
+    if (name == "etag") response->etag = value;
+    if (name == "date") response->date = value;
+    if (name == "x-amz-server-side-encryption") response->encryption = value;
+    if (name == "x-amz-request-id") response->requestId = value;
+    return n;
+}
+
+FileTransferResult ClassifyCurlError(CURLcode code) {
+    switch (code) {
+        case CURLE_OPERATION_TIMEDOUT:
+            return TimeOut;
+        case CURLE_COULDNT_RESOLVE_PROXY:
+        case CURLE_COULDNT_RESOLVE_HOST:
+        case CURLE_COULDNT_CONNECT:
+        case CURLE_SEND_ERROR:
+        case CURLE_RECV_ERROR:
+        case CURLE_GOT_NOTHING:
+        case CURLE_PARTIAL_FILE:
+        case CURLE_SSL_CONNECT_ERROR:
+        case CURLE_PEER_FAILED_VERIFICATION:
+        case CURLE_SEND_FAIL_REWIND:
+        case CURLE_HTTP2:
+        case CURLE_HTTP2_STREAM:
+        case CURLE_WEIRD_SERVER_REPLY:
+            return NetworkError;
+        default:
+            return InternalError;
+    }
+}
+
+struct CurlSlist {
+    curl_slist* list = nullptr;
+    ~CurlSlist() { curl_slist_free_all(list); }
+    bool Add(const std::string& line) {
+        curl_slist* next = curl_slist_append(list, line.c_str());
+        if (next == nullptr) return false;
+        list = next;
+        return true;
+    }
+};
+
+}  // namespace
+
+bool S3StoreConfig::Parse(const std::string& endpointUrl, S3StoreConfig& out, std::string& why) {
+    if (endpointUrl.empty()) {
+        out.endpoint.clear();
+        return true;
+    }
+    size_t schemeEnd = endpointUrl.find("://");
+    std::string scheme = Lower(endpointUrl.substr(0, schemeEnd));
+    if (schemeEnd == std::string::npos || (scheme != "http" && scheme != "https")) {
+        why = "endpoint URL must start with http:// or https://";
+        return false;
+    }
+    std::string rest = endpointUrl.substr(schemeEnd + 3);
+    size_t authorityEnd = rest.find_first_of("/?#");
+    std::string authority = rest.substr(0, authorityEnd);
+    std::string tail = authorityEnd == std::string::npos ? "" : rest.substr(authorityEnd);
+    if (!tail.empty() && tail != "/") {
+        why = "endpoint URL must not have a path, query or fragment";
+        return false;
+    }
+    if (authority.find('@') != std::string::npos) {
+        why = "endpoint URL must not carry a user name";
+        return false;
+    }
+    std::string host = authority;
+    std::string port;
+    if (!authority.empty() && authority[0] == '[') {
+        size_t close = authority.find(']');
+        if (close == std::string::npos || close == 1) {
+            why = "endpoint URL has a malformed IPv6 address";
+            return false;
+        }
+        host = authority.substr(0, close + 1);
+        std::string after = authority.substr(close + 1);
+        if (!after.empty() && after[0] != ':') {
+            why = "endpoint URL has a malformed IPv6 address";
+            return false;
+        }
+        if (!after.empty()) port = after.substr(1);
+        for (char c : host.substr(1, host.size() - 2)) {
+            if (!std::isxdigit(static_cast<unsigned char>(c)) && c != ':' && c != '.') {
+                why = "endpoint URL has a malformed IPv6 address";
+                return false;
+            }
+        }
+    } else {
+        size_t colon = authority.find(':');
+        if (colon != std::string::npos) {
+            host = authority.substr(0, colon);
+            port = authority.substr(colon + 1);
+            if (port.empty()) {
+                why = "endpoint URL has an empty port";
+                return false;
+            }
+        }
+        host = Lower(host);
+        for (unsigned char c : host) {
+            if (!std::isalnum(c) && c != '.' && c != '-' && c != '_') {
+                why = "endpoint URL has an invalid host name";
+                return false;
+            }
+        }
+    }
+    if (host.empty()) {
+        why = "endpoint URL has no host";
+        return false;
+    }
+    if (!port.empty()) {
+        long value = 0;
+        for (unsigned char c : port) {
+            if (!std::isdigit(c) || value > 65535) {
+                why = "endpoint URL has an invalid port";
+                return false;
+            }
+            value = value * 10 + (c - '0');
+        }
+        if (value < 1 || value > 65535) {
+            why = "endpoint URL has an invalid port";
+            return false;
+        }
+        port = std::to_string(value);
+    }
+    out.endpoint = scheme + "://" + host + (port.empty() ? "" : ":" + port);
+    return true;
+}
+
+S3Store::S3Store(S3StoreConfig config) : config_(std::move(config)), signer_(config_.clockOffset) {
+    // Thread-safe in this libcurl, but done once: it is process-wide and never undone.
+    static std::once_flag globalInit;
+    std::call_once(globalInit, [] { curl_global_init(CURL_GLOBAL_DEFAULT); });
+    multi_ = curl_multi_init();
+
+    S3StoreConfig parsed;
+    std::string why;
+    endpointValid_ = S3StoreConfig::Parse(config_.endpoint, parsed, why);
+    if (endpointValid_ && !parsed.endpoint.empty()) {
+        size_t schemeEnd = parsed.endpoint.find("://");
+        scheme_ = parsed.endpoint.substr(0, schemeEnd);
+        hostPort_ = parsed.endpoint.substr(schemeEnd + 3);
+    }
+    if (!endpointValid_) {
+        Logger::Put(4, kFile, "S3Store::S3Store", __LINE__, "unusable endpoint: %s", why.c_str());
+    }
+}
+
+S3Store::~S3Store() {
+    if (multi_ != nullptr) curl_multi_cleanup(static_cast<CURLM*>(multi_));
+}
+
+void S3Store::Cancel() {
+    cancelled_.store(true);
+    // Wakes a Put that waits in curl_multi_poll; a Put that is not waiting yet finds the
+    // wake-up pending (or the flag set) before it waits.
+    if (multi_ != nullptr) curl_multi_wakeup(static_cast<CURLM*>(multi_));
+}
+
+FileTransferResult S3Store::Put(const ObjectToStore& object, const StoreCredentials& credentials,
+                                FileTransferInfo* info) {
+    static const char kFunction[] = "S3Store::Put";
+    FileTransferInfo local;
+    if (info == nullptr) info = &local;
+    info->fileSize = 0;
+    info->responseTime = 0;
+
+    if (cancelled_.load()) return TimeOut;
+    if (credentials.accessKey.empty() || credentials.secretKey.empty()) {
+        Logger::Put(5, kFile, kFunction, __LINE__, "PUT %s/%s not sent: no credentials",
+                    object.bucket.c_str(), object.key.c_str());
+        return AuthenticationError;
+    }
+    if (!endpointValid_ || multi_ == nullptr) {
+        Logger::Put(4, kFile, kFunction, __LINE__, "PUT %s/%s not sent: store not usable",
+                    object.bucket.c_str(), object.key.c_str());
+        return InternalError;
+    }
+    if (object.bucket.empty() || object.key.empty() ||
+        (config_.endpoint.empty() && !HostLabelChars(object.bucket))) {
+        Logger::Put(5, kFile, kFunction, __LINE__, "PUT not sent: bad bucket or key \"%s/%s\"",
+                    object.bucket.c_str(), object.key.c_str());
+        return FilePathError;
+    }
+    if (config_.endpoint.empty() && !credentials.region.empty() &&
+        !HostLabelChars(credentials.region)) {
+        // The region comes with the credentials; new ones may bring a usable region.
+        Logger::Put(5, kFile, kFunction, __LINE__, "PUT %s/%s not sent: bad region \"%s\"",
+                    object.bucket.c_str(), object.key.c_str(), credentials.region.c_str());
+        return AuthenticationError;
+    }
+
+    // Where the request goes.
+    const std::string encodedKey = SigV4Signer::EncodePath(object.key);
+    std::string host, canonicalUri, url;
+    if (config_.endpoint.empty()) {
+        if (credentials.accelerate) {
+            host = object.bucket + ".s3-accelerate.amazonaws.com";
+        } else if (credentials.region.empty()) {
+            host = object.bucket + ".s3.amazonaws.com";
+        } else {
+            host = object.bucket + ".s3." + credentials.region + ".amazonaws.com";
+        }
+        canonicalUri = "/" + encodedKey;
+        url = "https://" + host + canonicalUri;
+    } else {
+        host = hostPort_;
+        canonicalUri = "/" + SigV4Signer::EncodeComponent(object.bucket) + "/" + encodedKey;
+        url = scheme_ + "://" + host + canonicalUri;
+    }
+
+    // What it carries.
+    const digest::Md5 md5 = digest::Md5Of(object.data, object.size);
+    const std::string md5Hex = digest::Hex(md5);
+    SigV4Request request;
+    request.method = "PUT";
+    request.canonicalUri = canonicalUri;
+    request.payloadHash = digest::Hex(digest::Sha256Of(object.data, object.size));
+    const std::string amzDate = SigV4Signer::AmzDate(signer_.Now());
+    request.headers = {{"host", host},
+                       {"content-md5", digest::Base64(md5)},
+                       {"content-type", HeaderValue(object.contentType)},
+                       {"x-amz-content-sha256", request.payloadHash},
+                       {"x-amz-date", amzDate}};
+    if (!credentials.sessionToken.empty()) {
+        request.headers.emplace_back("x-amz-security-token", HeaderValue(credentials.sessionToken));
+    }
+    for (const auto& [name, value] : object.metadata) {
+        request.headers.emplace_back("x-amz-meta-" + MetadataName(name), HeaderValue(value));
+    }
+    SigV4Key key{credentials.accessKey, credentials.secretKey,
+                 credentials.region.empty() ? "us-east-1" : credentials.region, "s3"};
+    const SigV4Signature signature = SigV4Signer::Sign(request, key, amzDate);
+    const std::vector<std::string> secrets = {credentials.secretKey, credentials.sessionToken,
+                                              signature.signature};
+
+    CurlSlist headers;
+    bool headersOk = headers.Add("Expect:");  // no 100-continue round trip
+    for (const auto& [name, value] : request.headers) headersOk &= headers.Add(name + ": " + value);
+    headersOk &= headers.Add("Authorization: " + signature.authorization);
+
+    CURL* easy = curl_easy_init();
+    if (easy == nullptr || !headersOk) {
+        if (easy != nullptr) curl_easy_cleanup(easy);
+        Logger::Put(4, kFile, kFunction, __LINE__, "PUT %s/%s not sent: out of memory",
+                    object.bucket.c_str(), object.key.c_str());
+        return InternalError;
+    }
+    Body body{object.data, object.size, 0};
+    S3Response response;
+    char curlError[CURL_ERROR_SIZE] = {};
+    curl_easy_setopt(easy, CURLOPT_URL, url.c_str());
+    curl_easy_setopt(easy, CURLOPT_PROTOCOLS_STR, "http,https");
+    curl_easy_setopt(easy, CURLOPT_UPLOAD, 1L);
+    curl_easy_setopt(easy, CURLOPT_INFILESIZE_LARGE, static_cast<curl_off_t>(object.size));
+    curl_easy_setopt(easy, CURLOPT_READFUNCTION, ReadBody);
+    curl_easy_setopt(easy, CURLOPT_READDATA, &body);
+    curl_easy_setopt(easy, CURLOPT_SEEKFUNCTION, SeekBody);
+    curl_easy_setopt(easy, CURLOPT_SEEKDATA, &body);
+    curl_easy_setopt(easy, CURLOPT_HEADERFUNCTION, KeepHeader);
+    curl_easy_setopt(easy, CURLOPT_HEADERDATA, &response);
+    curl_easy_setopt(easy, CURLOPT_WRITEFUNCTION, KeepBody);
+    curl_easy_setopt(easy, CURLOPT_WRITEDATA, &response);
+    curl_easy_setopt(easy, CURLOPT_HTTPHEADER, headers.list);
+    curl_easy_setopt(easy, CURLOPT_ERRORBUFFER, curlError);
+    curl_easy_setopt(easy, CURLOPT_NOSIGNAL, 1L);
+    curl_easy_setopt(easy, CURLOPT_CONNECTTIMEOUT_MS, config_.connectTimeoutMs);
+    curl_easy_setopt(easy, CURLOPT_LOW_SPEED_LIMIT, config_.lowSpeedLimit);
+    curl_easy_setopt(easy, CURLOPT_LOW_SPEED_TIME, config_.lowSpeedTimeS);
+    curl_easy_setopt(easy, CURLOPT_TCP_KEEPALIVE, 1L);
+
+    // The exchange. curl_multi_poll sleeps until the socket, a curl timer (connect and
+    // low-speed timeouts) or Cancel's curl_multi_wakeup needs attention.
+    CURLM* multi = static_cast<CURLM*>(multi_);
+    const auto started = std::chrono::steady_clock::now();
+    bool finished = false;
+    bool cancelled = false;
+    CURLcode transferCode = CURLE_OK;
+    CURLMcode multiCode = curl_multi_add_handle(multi, easy);
+    while (multiCode == CURLM_OK && !finished) {
+        if (cancelled_.load()) {
+            cancelled = true;
+            break;
+        }
+        int running = 0;
+        multiCode = curl_multi_perform(multi, &running);
+        int left = 0;
+        while (CURLMsg* message = curl_multi_info_read(multi, &left)) {
+            if (message->msg == CURLMSG_DONE && message->easy_handle == easy) {
+                transferCode = message->data.result;
+                finished = true;
+            }
+        }
+        if (finished || multiCode != CURLM_OK) break;
+        multiCode = curl_multi_poll(multi, nullptr, 0, kMaxWaitMs, nullptr);
+    }
+    info->responseTime =
+        static_cast<uint32_t>(std::chrono::duration_cast<std::chrono::milliseconds>(
+                                  std::chrono::steady_clock::now() - started)
+                                  .count());
+    curl_multi_remove_handle(multi, easy);
+    long status = 0;
+    curl_easy_getinfo(easy, CURLINFO_RESPONSE_CODE, &status);
+    curl_easy_cleanup(easy);
+    response.status = status;
+
+    // What it means.
+    const std::string where = object.bucket + "/" + object.key;
+    if (cancelled) {
+        Logger::Put(5, kFile, kFunction, __LINE__, "PUT %s cancelled after %u ms", where.c_str(),
+                    info->responseTime);
+        return TimeOut;
+    }
+    if (multiCode != CURLM_OK) {
+        Logger::Put(4, kFile, kFunction, __LINE__, "PUT %s: curl multi error %d", where.c_str(),
+                    static_cast<int>(multiCode));
+        return InternalError;
+    }
+    if (transferCode != CURLE_OK) {
+        FileTransferResult result = ClassifyCurlError(transferCode);
+        std::string text =
+            Redact(curlError[0] != '\0' ? curlError : curl_easy_strerror(transferCode), secrets);
+        Logger::Put(5, kFile, kFunction, __LINE__, "PUT %s failed after %u ms: %s (curl %d) -> %x",
+                    where.c_str(), info->responseTime, text.c_str(), static_cast<int>(transferCode),
+                    static_cast<unsigned>(result));
+        return result;
+    }
+
+    const std::string code = response.XmlElement("Code");
+    FileTransferResult result = ClassifyS3Answer(status, code);
+    if (result == Success) {
+        // With SSE-KMS the ETag is not the MD5 of the body; S3 has checked Content-MD5 then.
+        bool kms = response.encryption.compare(0, 7, "aws:kms") == 0;
+        if (!kms && !EtagMatches(response.etag, md5Hex)) {
+            Logger::Put(5, kFile, kFunction, __LINE__, "PUT %s: ETag %s is not the body's MD5 %s",
+                        where.c_str(), HeaderValue(response.etag).c_str(), md5Hex.c_str());
+            return FileBroken;
+        }
+        info->fileSize = object.size;
+        Logger::Put(13, kFile, kFunction, __LINE__, "PUT %s: %zu bytes stored in %u ms",
+                    where.c_str(), object.size, info->responseTime);
+        return Success;
+    }
+
+    std::string message = Redact(HeaderValue(response.XmlElement("Message")), secrets);
+    std::string requestId = HeaderValue(response.requestId);
+    if (!requestId.empty()) requestId = " request id " + requestId;
+    Logger::Put(5, kFile, kFunction, __LINE__, "PUT %s: HTTP %ld %s \"%s\"%s -> %x", where.c_str(),
+                status, HeaderValue(code).c_str(), message.c_str(), requestId.c_str(),
+                static_cast<unsigned>(result));
+    if (result == RequestTimeTooSkewed) {
+        std::chrono::system_clock::time_point serverTime;
+        if (ParseServerTime(response.date, serverTime) ||
+            ParseServerTime(response.XmlElement("ServerTime"), serverTime)) {
+            signer_.CorrectClock(serverTime);
+            Logger::Put(5, kFile, kFunction, __LINE__,
+                        "signing clock set to the server's time (offset %lld s)",
+                        static_cast<long long>(signer_.ClockOffset().count()));
+        } else {
+            Logger::Put(5, kFile, kFunction, __LINE__, "server time unknown; clock not corrected");
+        }
+    }
+    return result;
+}

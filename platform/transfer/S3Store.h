@@ -1,0 +1,71 @@
+// S3Store: stores each object with one signed HTTP PUT to an S3 bucket.
+//
+// Put runs on the upload thread, one call at a time, and blocks until S3 answered or the
+// attempt failed. The request carries the body's real SHA-256 (x-amz-content-sha256), its MD5
+// (Content-MD5, so S3 rejects a body damaged on the way), the session token when there is one,
+// and the object's metadata as x-amz-meta-* headers; it is signed with SigV4Signer. The answer
+// is read whole: the XML error Code decides the result, and on success the ETag must be the
+// body's MD5. After RequestTimeTooSkewed the signing clock is set to the server's time, so the
+// caller's retry can succeed.
+//
+// Cancel may come from any thread at any time (also before or between Puts). It ends a running
+// Put within 100 ms (curl_multi_wakeup interrupts the wait in curl_multi_poll) and makes every
+// later Put return TimeOut at once: a store serves one connection of the recorder and is not
+// used after it was cancelled. The caller keeps the store alive while Cancel may run.
+//
+// Owns a curl multi handle, and with it the connection cache, so consecutive Puts reuse one
+// TCP/TLS connection. Credentials and the Authorization header are never logged.
+#pragma once
+
+#include <atomic>
+#include <chrono>
+#include <string>
+
+#include "platform/transfer/ObjectStore.h"
+#include "platform/transfer/SigV4Signer.h"
+
+struct S3StoreConfig {
+    // "" for AWS: virtual-hosted https://BUCKET.s3.REGION.amazonaws.com/KEY, or
+    // https://BUCKET.s3-accelerate.amazonaws.com/KEY when the credentials ask for acceleration.
+    // "http[s]://host[:port]" for another S3 server: path-style ENDPOINT/BUCKET/KEY.
+    // Set it through Parse, which normalises it.
+    std::string endpoint;
+    long connectTimeoutMs = 10000;  // connection set-up (TCP and TLS)
+    long lowSpeedLimit = 1024;      // bytes per second; slower than this for ...
+    long lowSpeedTimeS = 30;        // ... this many seconds ends the transfer with TimeOut
+    // Initial offset of the signing clock against the system clock (tests use it to sign with
+    // a wrong clock); corrected after RequestTimeTooSkewed.
+    std::chrono::seconds clockOffset{0};
+
+    // Checks `endpointUrl` ("" or "http[s]://host[:port][/]", without user, path or query) and
+    // sets out.endpoint to its normal form; the other fields of `out` are left as they are.
+    // False with a reason in `why` when the URL cannot be used.
+    static bool Parse(const std::string& endpointUrl, S3StoreConfig& out, std::string& why);
+};
+
+class S3Store : public IObjectStore {
+  public:
+    explicit S3Store(S3StoreConfig config);
+    ~S3Store() override;
+    S3Store(const S3Store&) = delete;
+    S3Store& operator=(const S3Store&) = delete;
+
+    // Upload thread only. Fills info->fileSize (bytes stored; 0 when nothing was stored) and
+    // info->responseTime (ms from sending the request to the end of the answer).
+    FileTransferResult Put(const ObjectToStore& object, const StoreCredentials& credentials,
+                           FileTransferInfo* info) override;
+    // Any thread.
+    void Cancel() override;
+
+    // The signing clock's current offset against the system clock.
+    std::chrono::seconds ClockOffset() const { return signer_.ClockOffset(); }
+
+  private:
+    const S3StoreConfig config_;
+    bool endpointValid_ = false;  // config_.endpoint passed Parse
+    std::string scheme_;          // of a custom endpoint: "http" or "https"
+    std::string hostPort_;        // of a custom endpoint, as the Host header: "127.0.0.1:9000"
+    SigV4Signer signer_;
+    void* multi_ = nullptr;  // CURLM*, kept out of this header
+    std::atomic<bool> cancelled_{false};
+};
