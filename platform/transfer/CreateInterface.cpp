@@ -1,9 +1,103 @@
-// Until the stores are built, no transfer interface can be made.
+// VqStreamFileTransfer::CreateInterface: the transfer object for this process's options.
+//
+// `-endpoint file:///dir` stores into a local directory; any other endpoint (or none: AWS)
+// stores into S3. Only the `ts` segment format exists. A configuration that cannot work gives an
+// empty pointer and one log line that says why; the endpoint is logged without any user
+// information it may carry.
+#include <cctype>
+#include <string>
+
+#include "platform/framework/FrameworkOptions.h"
 #include "platform/logger/Logger.h"
 #include "platform/transfer/FileTransfer.h"
+#include "platform/transfer/LocalDirectoryStore.h"
+#include "platform/transfer/S3Store.h"
+#include "platform/transfer/SegmentTransfer.h"
+
+namespace {
+
+constexpr const char* kFile = "platform/transfer/CreateInterface";
+constexpr const char* kFunction = "VqStreamFileTransfer::CreateInterface";
+
+// The URL without "user:password@", for log lines.
+std::string withoutUserInfo(const std::string& url) {
+    size_t scheme = url.find("://");
+    size_t hostStart = scheme == std::string::npos ? 0 : scheme + 3;
+    size_t hostEnd = url.find_first_of("/?#", hostStart);
+    size_t at = url.rfind('@', hostEnd == std::string::npos ? std::string::npos : hostEnd);
+    if (at == std::string::npos || at < hostStart) return url;
+    return url.substr(0, hostStart) + "***@" + url.substr(at + 1);
+}
+
+bool startsWithNoCase(const std::string& text, const std::string& prefix) {
+    if (text.size() < prefix.size()) return false;
+    for (size_t i = 0; i < prefix.size(); ++i)
+        if (std::tolower(static_cast<unsigned char>(text[i])) != prefix[i]) return false;
+    return true;
+}
+
+// "file:///dir" or "file://localhost/dir" → "/dir" (percent-decoded, trailing '/' removed).
+// False for a relative path, another host, a query or fragment, or a bad escape.
+bool parseFileUrl(const std::string& url, std::string* directory) {
+    std::string rest = url.substr(7);  // after "file://"
+    if (startsWithNoCase(rest, "localhost/")) rest = rest.substr(9);
+    if (rest.empty() || rest[0] != '/' || rest.find_first_of("?#") != std::string::npos)
+        return false;
+    std::string path;
+    for (size_t i = 0; i < rest.size(); ++i) {
+        if (rest[i] != '%') {
+            path.push_back(rest[i]);
+            continue;
+        }
+        if (i + 2 >= rest.size() || !std::isxdigit(static_cast<unsigned char>(rest[i + 1])) ||
+            !std::isxdigit(static_cast<unsigned char>(rest[i + 2])))
+            return false;
+        char c = static_cast<char>(std::stoi(rest.substr(i + 1, 2), nullptr, 16));
+        if (c == '\0') return false;
+        path.push_back(c);
+        i += 2;
+    }
+    while (path.size() > 1 && path.back() == '/') path.pop_back();
+    *directory = path;
+    return true;
+}
+
+// Any endpoint that is not a file URL: an S3 store ("" means AWS itself).
+std::shared_ptr<IObjectStore> createS3Store(const FrameworkOptions& options) {
+    S3StoreConfig config;
+    std::string why;
+    if (!S3StoreConfig::Parse(options.endpoint, config, why)) {
+        Logger::Put(4, kFile, kFunction, __LINE__, "endpoint \"%s\" cannot be used: %s",
+                    withoutUserInfo(options.endpoint).c_str(), why.c_str());
+        return nullptr;
+    }
+    return std::make_shared<S3Store>(config);
+}
+
+}  // namespace
 
 std::shared_ptr<IFileTransfer> VqStreamFileTransfer::CreateInterface() {
-    Logger::Put(4, "platform/transfer/CreateInterface", "VqStreamFileTransfer::CreateInterface",
-                __LINE__, "no object store in this build");
-    return nullptr;
+    const FrameworkOptions& options = CurrentFrameworkOptions();
+    if (options.segmentFormat != "ts") {
+        Logger::Put(4, kFile, kFunction, __LINE__,
+                    "segment format \"%s\" is not supported (only \"ts\")",
+                    options.segmentFormat.c_str());
+        return nullptr;
+    }
+    std::shared_ptr<IObjectStore> store;
+    if (startsWithNoCase(options.endpoint, "file:")) {
+        std::string directory;
+        if (!startsWithNoCase(options.endpoint, "file://") ||
+            !parseFileUrl(options.endpoint, &directory)) {
+            Logger::Put(4, kFile, kFunction, __LINE__,
+                        "endpoint \"%s\" is not a usable file URL (file:///absolute/directory)",
+                        withoutUserInfo(options.endpoint).c_str());
+            return nullptr;
+        }
+        store = std::make_shared<LocalDirectoryStore>(directory);
+    } else {
+        store = createS3Store(options);
+        if (!store) return nullptr;
+    }
+    return std::make_shared<SegmentTransfer>(store, options.keyPrefix);
 }

@@ -1,0 +1,33 @@
+// ObjectKey: where a stream file is stored, and the metadata its object carries.
+//
+// Key: <keyPrefix><streamingId>/<YYYY>/<MM>/<DD>/<streamingId>_<YYYYMMDDThhmmss.mmmZ>_<seq>.ts
+// with the wall-clock capture time (UTC) of the object's first sample. The capture time makes
+// the keys of two runs of one stream differ although sequence numbers restart at 1.
+//
+// Pure functions; safe on any thread.
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <string>
+
+#include "platform/transfer/FileTransfer.h"
+
+// Capture time of the request's first sample: the earliest attribute1 (µs since the Unix
+// epoch) among the first samples of the three lists; 0 when the request has no samples.
+uint64_t FirstCaptureTime(const FileTransferRequest& request);
+
+// `micros` (µs since the Unix epoch) as 20261206T110010.012Z.
+std::string CompactUtcTime(uint64_t micros);
+// `micros` as 2026-12-06T11:00:10.012Z.
+std::string IsoUtcTime(uint64_t micros);
+
+std::string ObjectKey(const std::string& keyPrefix, const std::string& streamingId,
+                      int64_t sequenceNumber, uint64_t captureMicros);
+
+// The object's metadata (names without a transport prefix): "streaming-id", "sequence-number",
+// "duration-ms", "capture-time" (ISO 8601, UTC). Values are printable ASCII: other bytes and
+// '%' are percent-encoded, so a stream id can never smuggle a line break into a header.
+std::map<std::string, std::string> ObjectMetadata(const std::string& streamingId,
+                                                  int64_t sequenceNumber, uint32_t durationMs,
+                                                  uint64_t captureMicros);

@@ -1,0 +1,74 @@
+#include "platform/transfer/SegmentTransfer.h"
+
+#include <cinttypes>
+
+#include "platform/logger/Logger.h"
+#include "platform/transfer/ObjectKey.h"
+
+namespace {
+constexpr const char* kFile = "platform/transfer/SegmentTransfer";
+constexpr const char* kFunction = "SegmentTransfer::Transfer";
+}  // namespace
+
+SegmentTransfer::SegmentTransfer(std::shared_ptr<IObjectStore> store, std::string keyPrefix)
+    : store_(std::move(store)), keyPrefix_(std::move(keyPrefix)) {}
+
+void SegmentTransfer::Cancel() {
+    cancelled_ = true;
+    if (store_) store_->Cancel();
+}
+
+FileTransferResult SegmentTransfer::Transfer(const FileTransferRequest& request,
+                                             FileTransferInfo* info) {
+    FileTransferInfo localInfo;
+    if (!info) info = &localInfo;
+    info->fileSize = 0;
+    info->responseTime = 0;
+    if (cancelled_) return TimeOut;
+    if (!store_) return OtherError;
+
+    if (request.video.empty() && request.audio.empty() && request.meta.empty()) {
+        Logger::Put(13, kFile, kFunction, __LINE__,
+                    "stream file %" PRId64 " of %s has no samples: no object",
+                    request.sequenceNumber, request.streamingId.c_str());
+        return Success;
+    }
+
+    SegmentWriter::Report report;
+    std::string error;
+    if (!writer_.Write(request.video, request.audio, request.meta, &object_, &report, &error)) {
+        Logger::Put(5, kFile, kFunction, __LINE__,
+                    "cannot write stream file %" PRId64 " of %s as MPEG-TS: %s",
+                    request.sequenceNumber, request.streamingId.c_str(), error.c_str());
+        return FileBroken;
+    }
+    if (report.dropped > 0)
+        Logger::Put(5, kFile, kFunction, __LINE__,
+                    "stream file %" PRId64
+                    " of %s: %zu of %zu samples left out (unusable times, "
+                    "payload or codec)",
+                    request.sequenceNumber, request.streamingId.c_str(), report.dropped,
+                    report.dropped + report.written);
+
+    const uint64_t capture = FirstCaptureTime(request);
+    ObjectToStore object;
+    object.bucket = request.bucketName;
+    object.key = ObjectKey(keyPrefix_, request.streamingId, request.sequenceNumber, capture);
+    object.metadata =
+        ObjectMetadata(request.streamingId, request.sequenceNumber, request.duration, capture);
+    object.data = object_.data();
+    object.size = object_.size();
+
+    StoreCredentials credentials;
+    credentials.accessKey = request.accessKey;
+    credentials.secretKey = request.secretKey;
+    credentials.sessionToken = request.sessionToken;
+    credentials.region = request.region;
+    credentials.accelerate = request.s3Accel;
+
+    FileTransferResult result = store_->Put(object, credentials, info);
+    Logger::Put(13, kFile, kFunction, __LINE__, "%s/%s: %zu bytes, result %x",
+                object.bucket.c_str(), object.key.c_str(), object.size,
+                static_cast<unsigned>(result));
+    return result;
+}

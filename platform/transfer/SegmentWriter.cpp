@@ -1,0 +1,366 @@
+#include "platform/transfer/SegmentWriter.h"
+
+extern "C" {
+#include <libavcodec/avcodec.h>
+#include <libavformat/avformat.h>
+#include <libavutil/mathematics.h>
+}
+
+#include <climits>
+#include <memory>
+
+#include "platform/framework/ReceivedSample.h"
+#include "platform/logger/Logger.h"
+#include "platform/nal/StreamAnalyzer.h"
+
+namespace {
+
+constexpr const char* kFile = "platform/transfer/SegmentWriter";
+constexpr const char* kFunction = "SegmentWriter::Write";
+constexpr int kAvioBufferSize = 64 * 1024;
+constexpr int64_t kTicksPerSecond = 90000;  // the TS clock
+// Times beyond this many 90 kHz ticks (about 1.6 million years) cannot be offset without
+// overflow and are not real stream times.
+constexpr int64_t kTimeLimit = int64_t{1} << 60;
+
+std::string avError(int code) {
+    char text[AV_ERROR_MAX_STRING_SIZE] = {0};
+    av_strerror(code, text, sizeof(text));
+    return text;
+}
+
+// Audio codecs that the mpegts muxer writes with a stream type a reader recognises.
+bool audioTravelsInTs(AVCodecID id) {
+    switch (id) {
+        case AV_CODEC_ID_AAC:
+        case AV_CODEC_ID_AAC_LATM:
+        case AV_CODEC_ID_MP2:
+        case AV_CODEC_ID_MP3:
+        case AV_CODEC_ID_AC3:
+        case AV_CODEC_ID_EAC3:
+        case AV_CODEC_ID_DTS:
+        case AV_CODEC_ID_TRUEHD:
+        case AV_CODEC_ID_OPUS:
+        case AV_CODEC_ID_S302M:
+            return true;
+        default:
+            return false;
+    }
+}
+
+// The muxer's output, appended to the caller's buffer.
+#if LIBAVFORMAT_VERSION_MAJOR >= 61
+int appendToBuffer(void* opaque, const uint8_t* data, int size) {
+#else
+int appendToBuffer(void* opaque, uint8_t* data, int size) {
+#endif
+    auto* out = static_cast<std::vector<uint8_t>*>(opaque);
+    out->insert(out->end(), data, data + size);
+    return size;
+}
+
+// Owns one muxer and its I/O context for the length of one Write.
+struct Muxer {
+    AVFormatContext* context = nullptr;
+    AVIOContext* io = nullptr;
+    AVPacket* packet = nullptr;
+
+    ~Muxer() {
+        if (io) av_freep(&io->buffer);  // the muxer may have replaced the buffer we gave it
+        avio_context_free(&io);
+        avformat_free_context(context);
+        av_packet_free(&packet);
+    }
+};
+
+// One of the three sample lists on its way into the muxer.
+struct Track {
+    TrackDescription::Kind kind = TrackDescription::Kind::Video;
+    const std::vector<StreamData>* samples = nullptr;
+    const TrackDescription* description = nullptr;  // may be null (samples made without one)
+    AVStream* stream = nullptr;                     // null: the track is left out
+    AVCodecID codec = AV_CODEC_ID_NONE;
+    size_t next = 0;         // index of the next sample to consider
+    bool hasLast = false;    // a sample of this track is in the object
+    int64_t lastDts90k = 0;  // decode time of that sample, offset applied
+};
+
+// The times of one sample in 90 kHz ticks without the run's offset; false when the sample has
+// no usable clock or times.
+bool sampleTimes(const StreamData& sample, const TrackDescription* description, int64_t* pts,
+                 int64_t* dts) {
+    uint32_t clock = sample.attribute5;
+    if (clock == 0 && description) clock = description->clockRate;
+    if (clock == 0 || clock > static_cast<uint32_t>(INT_MAX)) return false;
+    const AVRational from{1, static_cast<int>(clock)};
+    const AVRational to{1, static_cast<int>(kTicksPerSecond)};
+    const auto rounding = static_cast<AVRounding>(AV_ROUND_NEAR_INF | AV_ROUND_PASS_MINMAX);
+    *pts = av_rescale_q_rnd(static_cast<int64_t>(sample.rtpTime), from, to, rounding);
+    *dts = av_rescale_q_rnd(static_cast<int64_t>(sample.attribute2), from, to, rounding);
+    return *pts > -kTimeLimit && *pts<kTimeLimit&& * dts> - kTimeLimit && *dts < kTimeLimit;
+}
+
+bool usablePayload(const StreamData& sample) {
+    size_t bytes = sample.PayloadBytes();
+    return sample.PayloadData() != nullptr && bytes > 0 &&
+           bytes <= static_cast<size_t>(INT_MAX - AV_INPUT_BUFFER_PADDING_SIZE);
+}
+
+// Sets the stream's codec parameters from the track description, or from its codec name when
+// it carries none. Returns false with a reason when the track cannot be described.
+bool describeStream(Track& track, AVCodecParameters* parameters, std::string* why) {
+    const TrackDescription* description = track.description;
+    if (description && description->codecParameters) {
+        const auto* source =
+            static_cast<const AVCodecParameters*>(description->codecParameters.get());
+        int rc = avcodec_parameters_copy(parameters, source);
+        if (rc < 0) {
+            *why = "cannot copy codec parameters: " + avError(rc);
+            return false;
+        }
+    } else {
+        std::string name = description ? description->codecName : std::string();
+        if (name.empty() && track.kind == TrackDescription::Kind::Video) name = "h264";
+        if (name.empty() && track.kind == TrackDescription::Kind::Meta) name = "bin_data";
+        const AVCodecDescriptor* codec = avcodec_descriptor_get_by_name(name.c_str());
+        if (!codec) {
+            *why = "unknown codec \"" + name + "\"";
+            return false;
+        }
+        parameters->codec_type = codec->type;
+        parameters->codec_id = codec->id;
+        if (codec->type == AVMEDIA_TYPE_AUDIO && description)
+            parameters->sample_rate = static_cast<int>(description->clockRate);
+    }
+    parameters->codec_tag = 0;  // tags of the input's container mean nothing in TS
+    if (track.kind == TrackDescription::Kind::Meta) {
+        // Whatever the input called its data, it travels as a data stream.
+        if (parameters->codec_id == AV_CODEC_ID_NONE) parameters->codec_id = AV_CODEC_ID_BIN_DATA;
+        if (parameters->codec_type != AVMEDIA_TYPE_SUBTITLE)
+            parameters->codec_type = AVMEDIA_TYPE_DATA;
+    }
+    if (track.kind == TrackDescription::Kind::Video && parameters->codec_id != AV_CODEC_ID_H264 &&
+        parameters->codec_id != AV_CODEC_ID_HEVC) {
+        *why = std::string("video codec ") + avcodec_get_name(parameters->codec_id) +
+               " is not H.264 or H.265";
+        return false;
+    }
+    track.codec = parameters->codec_id;
+    return true;
+}
+
+}  // namespace
+
+bool SegmentWriter::Write(const std::vector<StreamData>& video,
+                          const std::vector<StreamData>& audio, const std::vector<StreamData>& meta,
+                          std::vector<uint8_t>* out, Report* report, std::string* error) {
+    Report localReport;
+    if (!report) report = &localReport;
+    *report = Report();
+    std::string localError;
+    if (!error) error = &localError;
+    out->clear();
+
+    Track tracks[3];
+    tracks[0].kind = TrackDescription::Kind::Video;
+    tracks[0].samples = &video;
+    tracks[1].kind = TrackDescription::Kind::Audio;
+    tracks[1].samples = &audio;
+    tracks[2].kind = TrackDescription::Kind::Meta;
+    tracks[2].samples = &meta;
+
+    size_t payloadBytes = 0;
+    for (Track& track : tracks) {
+        for (const StreamData& sample : *track.samples) {
+            payloadBytes += sample.PayloadBytes();
+            if (!track.description && sample.source)
+                track.description = sample.source->Track().get();
+        }
+    }
+
+    // The run's origin: the earliest decode time among the first usable samples of the first
+    // object lands on kRunOrigin90k. Later objects reuse the same offset.
+    if (!hasOffset_) {
+        bool found = false;
+        int64_t earliest = 0;
+        for (Track& track : tracks) {
+            for (const StreamData& sample : *track.samples) {
+                int64_t pts = 0, dts = 0;
+                if (!usablePayload(sample) || !sampleTimes(sample, track.description, &pts, &dts))
+                    continue;
+                if (!found || dts < earliest) earliest = dts;
+                found = true;
+                break;
+            }
+        }
+        if (!found) {
+            report->dropped = video.size() + audio.size() + meta.size();
+            *error = "no sample has a payload and usable times";
+            return false;
+        }
+        offset90k_ = kRunOrigin90k - earliest;
+        hasOffset_ = true;
+    }
+
+    Muxer muxer;
+    int rc = avformat_alloc_output_context2(&muxer.context, nullptr, "mpegts", nullptr);
+    if (rc < 0 || !muxer.context) {
+        *error = "cannot create the mpegts muxer: " + avError(rc);
+        return false;
+    }
+    auto* ioBuffer = static_cast<unsigned char*>(av_malloc(kAvioBufferSize));
+    if (!ioBuffer) {
+        *error = "out of memory";
+        return false;
+    }
+    muxer.io =
+        avio_alloc_context(ioBuffer, kAvioBufferSize, 1, out, nullptr, appendToBuffer, nullptr);
+    if (!muxer.io) {
+        av_free(ioBuffer);
+        *error = "out of memory";
+        return false;
+    }
+    muxer.packet = av_packet_alloc();
+    if (!muxer.packet) {
+        *error = "out of memory";
+        return false;
+    }
+    AVFormatContext* context = muxer.context;
+    context->pb = muxer.io;
+    context->flags |= AVFMT_FLAG_CUSTOM_IO;
+    // Times are kept as they are: the run's offset already makes them non-negative, and a
+    // shift of one object alone would break continuity with its neighbours. Payloads are Annex
+    // B by contract; the muxer is not allowed to slip a bitstream filter (and a copy) in.
+    context->avoid_negative_ts = AVFMT_AVOID_NEG_TS_DISABLED;
+    context->flags &= ~AVFMT_FLAG_AUTO_BSF;
+
+    // TS overhead (headers, PES, PAT/PMT) stays well under 10 % of the payload.
+    out->reserve(payloadBytes + payloadBytes / 10 + 4096);
+
+    for (Track& track : tracks) {
+        if (track.samples->empty()) continue;
+        std::unique_ptr<AVCodecParameters, void (*)(AVCodecParameters*)> parameters(
+            avcodec_parameters_alloc(), [](AVCodecParameters* p) { avcodec_parameters_free(&p); });
+        if (!parameters) {
+            *error = "out of memory";
+            return false;
+        }
+        std::string why;
+        bool described = describeStream(track, parameters.get(), &why);
+        if (described && track.kind == TrackDescription::Kind::Audio &&
+            !audioTravelsInTs(track.codec)) {
+            described = false;
+            why = std::string(avcodec_get_name(track.codec)) + " cannot travel in MPEG-TS";
+        }
+        if (!described) {
+            if (track.kind != TrackDescription::Kind::Audio) {
+                *error = why;
+                return false;
+            }
+            // Without its audio the object is still worth having.
+            if (!audioRefusalLogged_) {
+                Logger::Put(5, kFile, kFunction, __LINE__, "audio is left out of the objects: %s",
+                            why.c_str());
+                audioRefusalLogged_ = true;
+            }
+            report->dropped += track.samples->size();
+            continue;
+        }
+        AVStream* stream = avformat_new_stream(context, nullptr);
+        if (!stream || avcodec_parameters_copy(stream->codecpar, parameters.get()) < 0) {
+            *error = "out of memory";
+            return false;
+        }
+        stream->time_base = AVRational{1, static_cast<int>(kTicksPerSecond)};
+        track.stream = stream;
+    }
+
+    if (context->nb_streams == 0) {
+        *error = "no track can be written";
+        return false;
+    }
+    rc = avformat_write_header(context, nullptr);
+    if (rc < 0) {
+        *error = "cannot start the TS object: " + avError(rc);
+        return false;
+    }
+
+    // Merge the lists by decode time. Ties go to video, then audio, then meta.
+    AVPacket* packet = muxer.packet;
+    while (true) {
+        Track* chosen = nullptr;
+        int64_t chosenPts = 0, chosenDts = 0;
+        for (Track& track : tracks) {
+            if (!track.stream) continue;
+            // Skip what the muxer cannot take; stop at the first usable sample.
+            while (track.next < track.samples->size()) {
+                const StreamData& sample = (*track.samples)[track.next];
+                int64_t pts = 0, dts = 0;
+                bool usable =
+                    usablePayload(sample) && sampleTimes(sample, track.description, &pts, &dts);
+                if (usable) {
+                    pts += offset90k_;
+                    dts += offset90k_;
+                    bool increasing = track.kind == TrackDescription::Kind::Meta
+                                          ? dts >= track.lastDts90k
+                                          : dts > track.lastDts90k;
+                    usable = dts >= 0 && pts >= dts && (!track.hasLast || increasing);
+                }
+                if (usable) {
+                    if (!chosen || dts < chosenDts) {
+                        chosen = &track;
+                        chosenPts = pts;
+                        chosenDts = dts;
+                    }
+                    break;
+                }
+                ++report->dropped;
+                ++track.next;
+            }
+        }
+        if (!chosen) break;
+
+        const StreamData& sample = (*chosen->samples)[chosen->next];
+        const uint8_t* data = sample.PayloadData();
+        const size_t size = sample.PayloadBytes();
+        bool key = true;
+        if (chosen->codec == AV_CODEC_ID_H264)
+            key = nal_access::StreamAnalyzer::IsIdrH264(data, size);
+        else if (chosen->codec == AV_CODEC_ID_HEVC)
+            key = nal_access::StreamAnalyzer::IsIdrH265(data, size);
+
+        // Not reference counted: av_write_frame reads the bytes during the call and keeps no
+        // reference, so the sample's own buffer is used as it is.
+        av_packet_unref(packet);
+        packet->data = const_cast<uint8_t*>(data);
+        packet->size = static_cast<int>(size);
+        packet->stream_index = chosen->stream->index;
+        packet->pts = av_rescale_q(chosenPts, AVRational{1, static_cast<int>(kTicksPerSecond)},
+                                   chosen->stream->time_base);
+        packet->dts = av_rescale_q(chosenDts, AVRational{1, static_cast<int>(kTicksPerSecond)},
+                                   chosen->stream->time_base);
+        packet->flags = key ? AV_PKT_FLAG_KEY : 0;
+        rc = av_write_frame(context, packet);
+        packet->data = nullptr;
+        packet->size = 0;
+        if (rc < 0) {
+            *error = "the muxer refused a sample: " + avError(rc);
+            return false;
+        }
+        chosen->hasLast = true;
+        chosen->lastDts90k = chosenDts;
+        ++chosen->next;
+        ++report->written;
+    }
+
+    rc = av_write_trailer(context);
+    if (rc < 0) {
+        *error = "cannot finish the TS object: " + avError(rc);
+        return false;
+    }
+    if (report->written == 0) {
+        *error = "no sample could be written";
+        return false;
+    }
+    return true;
+}
