@@ -7,7 +7,7 @@ packages=(
   libavformat-dev libavcodec-dev libavutil-dev
   libcurl4-openssl-dev libssl-dev
   libspdlog-dev libfmt-dev nlohmann-json3-dev
-  libunwind-dev libdw-dev
+  libunwind-dev libdw-dev libiberty-dev
   libgtest-dev libgmock-dev libbenchmark-dev
   ffmpeg awscli
 )

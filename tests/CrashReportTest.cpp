@@ -1,0 +1,398 @@
+// The crash reporter, seen from outside: programs that crash on purpose (tests/crashprogs)
+// run in a child process from a fresh directory, and the tests read the report that the
+// reporter appended beside the program.
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdlib>
+#include <ctime>
+#include <filesystem>
+#include <fstream>
+#include <regex>
+#include <string>
+#include <vector>
+
+#include "tests/support/TestSupport.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+using testsupport::BuildPath;
+using testsupport::ReadFile;
+using testsupport::WaitUntil;
+
+const char* const kSeparator =
+    "=============================================================================\r\n";
+
+std::string MonthlyLogName() {
+    time_t now = time(nullptr);
+    struct tm local {};
+    localtime_r(&now, &local);
+    char name[64];
+    std::snprintf(name, sizeof(name), "_Tracewright%d%02d.log", local.tm_year + 1900,
+                  local.tm_mon + 1);
+    return name;
+}
+
+int CountOf(const std::string& text, const std::string& piece) {
+    int count = 0;
+    for (size_t at = text.find(piece); at != std::string::npos; at = text.find(piece, at + 1)) {
+        ++count;
+    }
+    return count;
+}
+
+struct Ending {
+    pid_t pid = 0;
+    int status = 0;
+    bool finished = false;  // false: still running at the deadline (then killed)
+    std::string output;     // stdout and stderr
+    double seconds = 0;     // from start to end
+    int Signal() const { return WIFSIGNALED(status) ? WTERMSIG(status) : 0; }
+    bool Core() const { return WIFSIGNALED(status) && WCOREDUMP(status); }
+};
+
+// A copy of a test program in a directory of its own, so that reports of tests that run at
+// the same time never meet.
+class ProgramCopy {
+  public:
+    explicit ProgramCopy(const std::string& buildRelative) {
+        std::string templ = (fs::temp_directory_path() / "sfr-crash-XXXXXX").string();
+        dir_ = mkdtemp(templ.data());
+        program_ = dir_ + "/" + fs::path(buildRelative).filename().string();
+        fs::copy_file(BuildPath(buildRelative), program_);
+    }
+    ~ProgramCopy() {
+        std::error_code ignored;
+        fs::remove_all(dir_, ignored);
+    }
+
+    // Starts the program with `args` in its directory; `coreLimit` < 0 keeps the limit.
+    pid_t Start(const std::vector<std::string>& args,
+                const std::vector<std::string>& environment = {}, long coreLimit = -1) {
+        std::string outputPath = dir_ + "/output.txt";
+        pid_t pid = fork();
+        if (pid == 0) {
+            int fd = open(outputPath.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0644);
+            dup2(fd, 1);
+            dup2(fd, 2);
+            if (chdir(dir_.c_str()) != 0) _exit(126);
+            if (coreLimit >= 0) {
+                struct rlimit limit {};
+                limit.rlim_cur = limit.rlim_max =
+                    coreLimit == 0 ? 0 : static_cast<rlim_t>(RLIM_INFINITY);
+                setrlimit(RLIMIT_CORE, &limit);
+            }
+            for (const auto& entry : environment) putenv(const_cast<char*>(entry.c_str()));
+            std::vector<char*> argv{const_cast<char*>(program_.c_str())};
+            for (const auto& arg : args) argv.push_back(const_cast<char*>(arg.c_str()));
+            argv.push_back(nullptr);
+            execv(program_.c_str(), argv.data());
+            _exit(127);
+        }
+        started_ = std::chrono::steady_clock::now();
+        return pid;
+    }
+
+    Ending Wait(pid_t pid, int timeoutMs = 60000) {
+        Ending ending;
+        ending.pid = pid;
+        ending.finished =
+            WaitUntil([&] { return waitpid(pid, &ending.status, WNOHANG) == pid; }, timeoutMs);
+        if (!ending.finished) {
+            kill(pid, SIGKILL);
+            waitpid(pid, &ending.status, 0);
+        }
+        ending.seconds =
+            std::chrono::duration<double>(std::chrono::steady_clock::now() - started_).count();
+        ending.output = ReadFile(dir_ + "/output.txt");
+        return ending;
+    }
+
+    Ending Run(const std::vector<std::string>& args,
+               const std::vector<std::string>& environment = {}, long coreLimit = -1) {
+        return Wait(Start(args, environment, coreLimit));
+    }
+
+    std::string Report() const { return ReadFile(dir_ + "/" + MonthlyLogName()); }
+    const std::string& Dir() const { return dir_; }
+    const std::string& Program() const { return program_; }
+
+  private:
+    std::string dir_;
+    std::string program_;
+    std::chrono::steady_clock::time_point started_;
+};
+
+const char* const kReporting = "tests/crashprogs/crash_program";
+const char* const kPlain = "tests/crashprogs/crash_program_plain";
+
+// The line of the crash program that holds `code`.
+int SourceLineOf(const std::string& code) {
+    std::ifstream source(std::string(SFR_SOURCE_DIR) + "/tests/crashprogs/CrashProgram.cpp");
+    std::string line;
+    for (int number = 1; std::getline(source, line); ++number) {
+        if (line.find(code) != std::string::npos) return number;
+    }
+    return -1;
+}
+
+std::string FirstMatch(const std::string& text, const std::string& pattern, int group = 1) {
+    std::smatch match;
+    if (!std::regex_search(text, match, std::regex(pattern))) return "";
+    return match[group];
+}
+
+// --- What a report says about an access violation ---------------------------------------
+
+TEST(CrashReportContent, WriteToInvalidAddressNamesTheFaultAndItsPlace) {
+    ProgramCopy program(kReporting);
+    Ending ending = program.Run({"write-invalid"});
+    ASSERT_TRUE(ending.finished);
+    EXPECT_EQ(ending.Signal(), SIGSEGV);
+    std::string report = program.Report();
+    ASSERT_FALSE(report.empty()) << "no " << MonthlyLogName() << " beside the program";
+
+    // Title between two separators, with the computer's name.
+    char host[256] = {};
+    gethostname(host, sizeof(host) - 1);
+    EXPECT_EQ(report.rfind(kSeparator, 0), 0u);
+    EXPECT_TRUE(std::regex_search(
+        report, std::regex("\r\n  Tracewright's Report --- \\d{4}/\\d\\d/\\d\\d \\d\\d:\\d\\d:"
+                           "\\d\\d\\.\\d{3} at " +
+                           std::string(host) + "\r\n={77}\r\n")))
+        << report;
+    EXPECT_NE(report.find("Exception code: C0000005 ACCESS_VIOLATION\r\n"), std::string::npos);
+    EXPECT_NE(report.find("Access address: BAD0(Write)\r\n"), std::string::npos);
+    EXPECT_NE(report.find("Module        : " + program.Program() + "\r\n"), std::string::npos);
+
+    // The fault address is the interrupted instruction, in a segment of the program.
+    std::string fault =
+        FirstMatch(report, "Fault address : ([0-9A-F]{16}) ([0-9A-F]{2}):[0-9A-F]{16}\r\n");
+    std::string segment = FirstMatch(report, "Fault address : [0-9A-F]{16} ([0-9A-F]{2}):", 1);
+    EXPECT_EQ(FirstMatch(report, "CS:EIP: [0-9A-F]{4}:([0-9A-F]{16})\r\n"), fault);
+    EXPECT_NE(segment, "00");
+
+    // The main thread's id is the process id.
+    std::string hex = FirstMatch(report, "Current thread: ([0-9A-F]{8})\\((\\d+)\\)\r\n", 1);
+    std::string dec = FirstMatch(report, "Current thread: ([0-9A-F]{8})\\((\\d+)\\)\r\n", 2);
+    ASSERT_FALSE(hex.empty());
+    EXPECT_EQ(std::stol(hex, nullptr, 16), ending.pid);
+    EXPECT_EQ(std::stol(dec), ending.pid);
+
+    EXPECT_NE(report.find("Function      : (anonymous namespace)::WriteToInvalidAddress(int*)\r\n"),
+              std::string::npos);
+    EXPECT_NE(report.find("CrashProgram.cpp Line:" +
+                          std::to_string(SourceLineOf("*const_cast<volatile int*>(target) = 42;")) +
+                          "\r\n"),
+              std::string::npos)
+        << report;
+
+    // The call stack runs from the fault out to main.
+    size_t stack = report.find("\r\nCall stack    :\r\n-----");
+    ASSERT_NE(stack, std::string::npos);
+    size_t fault0 = report.find("  (anonymous namespace)::WriteToInvalidAddress(int*)+", stack);
+    size_t caller = report.find("  (anonymous namespace)::CallerOfTheFault(", stack);
+    size_t main = report.find("  main+", stack);
+    EXPECT_TRUE(fault0 != std::string::npos && fault0 < caller && caller < main) << report;
+
+    // Registers in full width; every line ends in CR LF; the report ends in an empty line.
+    EXPECT_TRUE(std::regex_search(report, std::regex("\r\nRegisters     : EAX: [0-9A-F]{16}\r\n"
+                                                     "                EBX: [0-9A-F]{16}\r\n")));
+    EXPECT_TRUE(std::regex_search(report, std::regex("SS:ESP: [0-9A-F]{4}:[0-9A-F]{16}\r\n"
+                                                     " {16}Flags : [0-9A-F]{8}\r\n\r\n\r\n$")));
+    EXPECT_EQ(CountOf(report, "\n"), CountOf(report, "\r\n"));
+}
+
+TEST(CrashReportContent, ReadFromInvalidAddressSaysRead) {
+    ProgramCopy program(kReporting);
+    EXPECT_EQ(program.Run({"read-invalid"}).Signal(), SIGSEGV);
+    std::string report = program.Report();
+    EXPECT_NE(report.find("Access address: BAD0(Read)\r\n"), std::string::npos) << report;
+    EXPECT_NE(report.find("Function      : (anonymous namespace)::ReadFromInvalidAddress("),
+              std::string::npos);
+}
+
+// --- How crashes are named ---------------------------------------------------------------
+
+TEST(CrashReportNaming, IntegerDivisionByZero) {
+    ProgramCopy program(kReporting);
+    EXPECT_EQ(program.Run({"divide"}).Signal(), SIGFPE);
+    std::string report = program.Report();
+    EXPECT_NE(report.find("Exception code: C0000094 INT_DIVIDE_BY_ZERO\r\n"), std::string::npos);
+    EXPECT_EQ(report.find("Access address"), std::string::npos);
+    EXPECT_NE(report.find("Function      : (anonymous namespace)::DivideBy(int)\r\n"),
+              std::string::npos);
+}
+
+TEST(CrashReportNaming, StackOverflowIsWalkedAndCutShort) {
+    ProgramCopy program(kReporting);
+    Ending ending = program.Run({"recurse"});
+    EXPECT_EQ(ending.Signal(), SIGSEGV);
+    // Starting, recursing through the 8 MB stack and reporting: seconds, not minutes.
+    EXPECT_LT(ending.seconds, 10.0);
+    std::string report = program.Report();
+    EXPECT_NE(report.find("Exception code: C00000FD STACK_OVERFLOW\r\n"), std::string::npos);
+    EXPECT_EQ(report.find("Function      :"), std::string::npos);  // skipped for an overflow
+    // Innermost frames, a count of those left out, then the way in from main.
+    std::string omitted =
+        FirstMatch(report, "\r\n +\\.\\.\\. (\\d+) frames not shown \\.\\.\\.\r\n");
+    ASSERT_FALSE(omitted.empty()) << report.substr(0, 4000);
+    EXPECT_GT(std::stol(omitted), 1000);
+    EXPECT_GE(CountOf(report, "RecurseForever(int)+"), 256);
+    EXPECT_NE(report.find("  main+", report.find(" frames not shown ")), std::string::npos);
+}
+
+TEST(CrashReportNaming, UnhandledExceptionGivesTypeAndText) {
+    ProgramCopy program(kReporting);
+    Ending ending = program.Run({"throw"});
+    EXPECT_EQ(ending.Signal(), SIGABRT);
+    EXPECT_NE(program.Report().find("Exception code: E0000006 Unhandled C++ exception "
+                                    "std::runtime_error: disk full on /data\r\n"),
+              std::string::npos)
+        << program.Report();
+    // The previous terminate handler still had its say.
+    EXPECT_NE(ending.output.find("disk full on /data"), std::string::npos);
+}
+
+TEST(CrashReportNaming, SignalOffTheTableIsNamedByStrsignal) {
+    ProgramCopy program(kReporting);
+    EXPECT_EQ(program.Run({"abort"}).Signal(), SIGABRT);
+    std::string expected = "Exception code: E0000006 " + std::string(strsignal(SIGABRT)) + "\r\n";
+    EXPECT_NE(program.Report().find(expected), std::string::npos) << program.Report();
+}
+
+// --- One report per crash, appended ------------------------------------------------------
+
+TEST(CrashReportOnce, CrashInsideTheReportWritesNoSecondReport) {
+    // Same signal again inside the handler, and a different one.
+    for (const char* mode : {"fault-in-report-same", "fault-in-report-other"}) {
+        ProgramCopy program(kReporting);
+        Ending ending = program.Run({mode});
+        ASSERT_TRUE(ending.finished) << mode;
+        EXPECT_EQ(ending.Signal(), SIGSEGV) << mode;
+        std::string report = program.Report();
+        EXPECT_EQ(CountOf(report, "Tracewright's Report"), 1) << mode;
+        // What was written before the second crash is on disk.
+        EXPECT_NE(report.find("Current thread: "), std::string::npos) << mode;
+    }
+}
+
+TEST(CrashReportOnce, HungReportStillEndsTheProcessByItsSignal) {
+    ProgramCopy program(kReporting);
+    Ending ending = program.Run({"hang-in-report"}, {}, 0);
+    ASSERT_TRUE(ending.finished);
+    EXPECT_EQ(ending.Signal(), SIGSEGV);
+    EXPECT_NE(program.Report().find("Access address: BAD0(Write)\r\n"), std::string::npos);
+}
+
+TEST(CrashReportOnce, TwoThreadsCrashingTogetherGiveOneReport) {
+    ProgramCopy program(kReporting);
+    Ending ending = program.Run({"two-threads"});
+    ASSERT_TRUE(ending.finished);
+    EXPECT_EQ(ending.Signal(), SIGSEGV);
+    EXPECT_NE(ending.output.find("second thread is in the handler"), std::string::npos)
+        << ending.output;
+    std::string report = program.Report();
+    EXPECT_EQ(CountOf(report, "Tracewright's Report"), 1);
+    // The report that was written is whole.
+    EXPECT_NE(report.find("Flags : "), std::string::npos);
+}
+
+TEST(CrashReportOnce, CrashesOfOneMonthAppendToOneFile) {
+    ProgramCopy program(kReporting);
+    program.Run({"write-invalid"});
+    program.Run({"divide"});
+    std::string report = program.Report();
+    EXPECT_EQ(CountOf(report, "Tracewright's Report"), 2);
+    size_t first = report.find("C0000005 ACCESS_VIOLATION");
+    size_t second = report.find("C0000094 INT_DIVIDE_BY_ZERO");
+    EXPECT_TRUE(first != std::string::npos && first < second);
+    int logs = 0;
+    for (const auto& entry : fs::directory_iterator(program.Dir())) {
+        if (entry.path().filename().string().rfind("_Tracewright", 0) == 0) ++logs;
+    }
+    EXPECT_EQ(logs, 1);
+}
+
+// --- The process ends as it would have -----------------------------------------------------
+
+TEST(CrashReportEnding, SameSignalAndCoreDumpAsWithoutTheReporter) {
+    for (const char* mode : {"write-invalid", "divide", "recurse", "abort", "throw"}) {
+        for (long coreLimit : {0L, 1L}) {
+            ProgramCopy reporting(kReporting);
+            ProgramCopy plain(kPlain);
+            Ending withReporter = reporting.Run({mode}, {}, coreLimit);
+            Ending without = plain.Run({mode}, {}, coreLimit);
+            EXPECT_NE(without.Signal(), 0) << mode;
+            EXPECT_EQ(withReporter.Signal(), without.Signal()) << mode;
+            EXPECT_EQ(withReporter.Core(), without.Core()) << mode << " core limit " << coreLimit;
+            if (coreLimit == 0) {
+                EXPECT_FALSE(withReporter.Core()) << mode;
+            }
+            EXPECT_FALSE(reporting.Report().empty()) << mode;
+        }
+    }
+}
+
+TEST(CrashReportEnding, PreviousHandlerGetsTheSignalAndReportAllocatesNothingOfItsOwn) {
+    // The program counts heap allocations from the crash on, by whether libdw (source lines)
+    // is on the stack; its own SIGSEGV handler, installed before the reporter, prints them.
+    ProgramCopy program(kReporting);
+    Ending ending = program.Run({"count-allocations"}, {"CRASH_PROGRAM_PREVIOUS_HANDLER=1"});
+    EXPECT_EQ(ending.Signal(), SIGSEGV);
+    std::string own = FirstMatch(ending.output, "previous handler: own-allocations=(\\d+)");
+    ASSERT_FALSE(own.empty()) << ending.output;
+    EXPECT_EQ(own, "0") << ending.output;
+    // The report is complete, with the source line (the part that lets libdw allocate).
+    EXPECT_NE(program.Report().find("Source file   : "), std::string::npos);
+    EXPECT_NE(program.Report().find("Flags : "), std::string::npos);
+}
+
+// --- The recorder itself -------------------------------------------------------------------
+
+// True once `pid` runs `program` (exec done) and catches SIGSEGV (the reporter is installed).
+bool CatchesSegv(pid_t pid, const std::string& program) {
+    std::error_code error;
+    fs::path running = fs::read_symlink("/proc/" + std::to_string(pid) + "/exe", error);
+    if (error || running != fs::path(program)) return false;
+    std::ifstream status("/proc/" + std::to_string(pid) + "/status");
+    std::string line;
+    while (std::getline(status, line)) {
+        if (line.rfind("SigCgt:", 0) == 0) {
+            unsigned long long mask = std::stoull(line.substr(7), nullptr, 16);
+            return (mask & (1ULL << (SIGSEGV - 1))) != 0;
+        }
+    }
+    return false;
+}
+
+TEST(CrashReportRecorder, KillSegvLeavesAReportBesideTheExecutable) {
+    ProgramCopy recorder("src/stream-file-recorder");
+    // The status output is a FIFO nobody reads: opening it blocks, so the recorder stays in
+    // Initialize until it is killed. AddressSanitizer's own SIGSEGV handler is off so that the
+    // reporter's handler is the only one and the signal goes on to the default action.
+    std::string fifo = recorder.Dir() + "/status.fifo";
+    ASSERT_EQ(mkfifo(fifo.c_str(), 0600), 0);
+    pid_t pid = recorder.Start({"-bucketname", "b", "-uploadinterval", "10", "-authretrytime", "1",
+                                "-bufferfullsize", "100", "-kct", "h264", "-status", fifo},
+                               {"ASAN_OPTIONS=handle_segv=0"});
+    ASSERT_TRUE(WaitUntil([&] { return CatchesSegv(pid, recorder.Program()); }, 30000));
+    ASSERT_EQ(kill(pid, SIGSEGV), 0);
+    Ending ending = recorder.Wait(pid);
+    EXPECT_EQ(ending.Signal(), SIGSEGV) << ending.output;
+    std::string report = recorder.Report();
+    EXPECT_NE(report.find("Exception code: C0000005 ACCESS_VIOLATION\r\n"), std::string::npos)
+        << report << ending.output;
+    EXPECT_EQ(report.find("Access address"), std::string::npos);  // sent, not a fault
+    EXPECT_NE(report.find("BaseProcess::Initialize()+"), std::string::npos) << report;
+    EXPECT_NE(report.find("  main+"), std::string::npos);
+}
+
+}  // namespace
