@@ -15,6 +15,7 @@
 #include "platform/transfer/Digest.h"
 #include "platform/transfer/S3Response.h"
 #include "platform/transfer/S3Store.h"
+#include "platform/transfer/S3Target.h"
 #include "tests/support/S3rver.h"
 #include "tests/support/TestSupport.h"
 
@@ -449,4 +450,36 @@ TEST(S3StoreConfigTest, ReadsServerAnswers) {
     EXPECT_EQ(system_clock::to_time_t(t), 1369353601);
     EXPECT_FALSE(ParseServerTime("yesterday", t));
     EXPECT_FALSE(ParseServerTime("Fri, 24 Foo 2013 00:00:00 GMT", t));
+}
+
+TEST(S3StoreConfigTest, AddressesObjects) {
+    StoreCredentials routing{"ak", "sk", "", "eu-west-1", false};
+    S3Target t;
+    std::string why;
+    ASSERT_TRUE(S3TargetFor("", "my-bucket", "cam 1/a+b.ts", routing, t, why));
+    EXPECT_EQ(t.url, "https://my-bucket.s3.eu-west-1.amazonaws.com/cam%201/a%2Bb.ts");
+    EXPECT_EQ(t.host, "my-bucket.s3.eu-west-1.amazonaws.com");
+    EXPECT_EQ(t.canonicalUri, "/cam%201/a%2Bb.ts");
+    EXPECT_EQ(t.signingRegion, "eu-west-1");
+
+    routing.accelerate = true;
+    ASSERT_TRUE(S3TargetFor("", "my-bucket", "k.ts", routing, t, why));
+    EXPECT_EQ(t.url, "https://my-bucket.s3-accelerate.amazonaws.com/k.ts");
+    EXPECT_EQ(t.signingRegion, "eu-west-1");
+
+    // Acceleration is an AWS service: a custom endpoint stays path-style.
+    ASSERT_TRUE(S3TargetFor("http://127.0.0.1:9000", "rec", "a/b c.ts", routing, t, why));
+    EXPECT_EQ(t.url, "http://127.0.0.1:9000/rec/a/b%20c.ts");
+    EXPECT_EQ(t.host, "127.0.0.1:9000");
+    EXPECT_EQ(t.canonicalUri, "/rec/a/b%20c.ts");
+
+    routing = StoreCredentials{"ak", "sk", "", "", false};
+    ASSERT_TRUE(S3TargetFor("", "b", "k", routing, t, why));
+    EXPECT_EQ(t.host, "b.s3.amazonaws.com");
+    EXPECT_EQ(t.signingRegion, "us-east-1");
+
+    EXPECT_FALSE(S3TargetFor("", "Bad_Bucket", "k", routing, t, why));
+    EXPECT_FALSE(S3TargetFor("", "b", "", routing, t, why));
+    routing.region = "eu-west-1.evil.example/";
+    EXPECT_FALSE(S3TargetFor("", "b", "k", routing, t, why));
 }

@@ -11,6 +11,7 @@
 #include "platform/logger/Logger.h"
 #include "platform/transfer/Digest.h"
 #include "platform/transfer/S3Response.h"
+#include "platform/transfer/S3Target.h"
 
 namespace {
 
@@ -48,15 +49,6 @@ std::string MetadataName(const std::string& name) {
         if (!std::isalnum(static_cast<unsigned char>(c)) && c != '-' && c != '_') c = '-';
     }
     return out;
-}
-
-// Host names S3 can serve a bucket or region under (lower case, digits, '.', '-').
-bool HostLabelChars(const std::string& text) {
-    if (text.empty()) return false;
-    for (unsigned char c : text) {
-        if (!(std::islower(c) || std::isdigit(c) || c == '.' || c == '-')) return false;
-    }
-    return true;
 }
 
 // Replaces every occurrence of the secrets in a text that is about to be logged.
@@ -256,11 +248,7 @@ S3Store::S3Store(S3StoreConfig config) : config_(std::move(config)), signer_(con
     S3StoreConfig parsed;
     std::string why;
     endpointValid_ = S3StoreConfig::Parse(config_.endpoint, parsed, why);
-    if (endpointValid_ && !parsed.endpoint.empty()) {
-        size_t schemeEnd = parsed.endpoint.find("://");
-        scheme_ = parsed.endpoint.substr(0, schemeEnd);
-        hostPort_ = parsed.endpoint.substr(schemeEnd + 3);
-    }
+    endpoint_ = parsed.endpoint;
     if (!endpointValid_) {
         Logger::Put(4, kFile, "S3Store::S3Store", __LINE__, "unusable endpoint: %s", why.c_str());
     }
@@ -296,37 +284,14 @@ FileTransferResult S3Store::Put(const ObjectToStore& object, const StoreCredenti
                     object.bucket.c_str(), object.key.c_str());
         return InternalError;
     }
-    if (object.bucket.empty() || object.key.empty() ||
-        (config_.endpoint.empty() && !HostLabelChars(object.bucket))) {
-        Logger::Put(5, kFile, kFunction, __LINE__, "PUT not sent: bad bucket or key \"%s/%s\"",
-                    object.bucket.c_str(), object.key.c_str());
-        return FilePathError;
-    }
-    if (config_.endpoint.empty() && !credentials.region.empty() &&
-        !HostLabelChars(credentials.region)) {
-        // The region comes with the credentials; new ones may bring a usable region.
-        Logger::Put(5, kFile, kFunction, __LINE__, "PUT %s/%s not sent: bad region \"%s\"",
-                    object.bucket.c_str(), object.key.c_str(), credentials.region.c_str());
-        return AuthenticationError;
-    }
-
-    // Where the request goes.
-    const std::string encodedKey = SigV4Signer::EncodePath(object.key);
-    std::string host, canonicalUri, url;
-    if (config_.endpoint.empty()) {
-        if (credentials.accelerate) {
-            host = object.bucket + ".s3-accelerate.amazonaws.com";
-        } else if (credentials.region.empty()) {
-            host = object.bucket + ".s3.amazonaws.com";
-        } else {
-            host = object.bucket + ".s3." + credentials.region + ".amazonaws.com";
-        }
-        canonicalUri = "/" + encodedKey;
-        url = "https://" + host + canonicalUri;
-    } else {
-        host = hostPort_;
-        canonicalUri = "/" + SigV4Signer::EncodeComponent(object.bucket) + "/" + encodedKey;
-        url = scheme_ + "://" + host + canonicalUri;
+    S3Target target;
+    std::string why;
+    if (!S3TargetFor(endpoint_, object.bucket, object.key, credentials, target, why)) {
+        // A region comes with the credentials, and new ones may bring a usable one.
+        bool region = why.find("region") != std::string::npos;
+        Logger::Put(5, kFile, kFunction, __LINE__, "PUT \"%s/%s\" not sent: %s",
+                    object.bucket.c_str(), object.key.c_str(), why.c_str());
+        return region ? AuthenticationError : FilePathError;
     }
 
     // What it carries.
@@ -334,10 +299,10 @@ FileTransferResult S3Store::Put(const ObjectToStore& object, const StoreCredenti
     const std::string md5Hex = digest::Hex(md5);
     SigV4Request request;
     request.method = "PUT";
-    request.canonicalUri = canonicalUri;
+    request.canonicalUri = target.canonicalUri;
     request.payloadHash = digest::Hex(digest::Sha256Of(object.data, object.size));
     const std::string amzDate = SigV4Signer::AmzDate(signer_.Now());
-    request.headers = {{"host", host},
+    request.headers = {{"host", target.host},
                        {"content-md5", digest::Base64(md5)},
                        {"content-type", HeaderValue(object.contentType)},
                        {"x-amz-content-sha256", request.payloadHash},
@@ -348,8 +313,7 @@ FileTransferResult S3Store::Put(const ObjectToStore& object, const StoreCredenti
     for (const auto& [name, value] : object.metadata) {
         request.headers.emplace_back("x-amz-meta-" + MetadataName(name), HeaderValue(value));
     }
-    SigV4Key key{credentials.accessKey, credentials.secretKey,
-                 credentials.region.empty() ? "us-east-1" : credentials.region, "s3"};
+    SigV4Key key{credentials.accessKey, credentials.secretKey, target.signingRegion, "s3"};
     const SigV4Signature signature = SigV4Signer::Sign(request, key, amzDate);
     const std::vector<std::string> secrets = {credentials.secretKey, credentials.sessionToken,
                                               signature.signature};
@@ -369,7 +333,7 @@ FileTransferResult S3Store::Put(const ObjectToStore& object, const StoreCredenti
     Body body{object.data, object.size, 0};
     S3Response response;
     char curlError[CURL_ERROR_SIZE] = {};
-    curl_easy_setopt(easy, CURLOPT_URL, url.c_str());
+    curl_easy_setopt(easy, CURLOPT_URL, target.url.c_str());
     curl_easy_setopt(easy, CURLOPT_PROTOCOLS_STR, "http,https");
     curl_easy_setopt(easy, CURLOPT_UPLOAD, 1L);
     curl_easy_setopt(easy, CURLOPT_INFILESIZE_LARGE, static_cast<curl_off_t>(object.size));

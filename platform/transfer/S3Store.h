@@ -28,7 +28,7 @@ struct S3StoreConfig {
     // "" for AWS: virtual-hosted https://BUCKET.s3.REGION.amazonaws.com/KEY, or
     // https://BUCKET.s3-accelerate.amazonaws.com/KEY when the credentials ask for acceleration.
     // "http[s]://host[:port]" for another S3 server: path-style ENDPOINT/BUCKET/KEY.
-    // Set it through Parse, which normalises it.
+    // Parse checks and normalises it; the store uses only what Parse accepts.
     std::string endpoint;
     long connectTimeoutMs = 10000;  // connection set-up (TCP and TLS)
     long lowSpeedLimit = 1024;      // bytes per second; slower than this for ...
@@ -63,8 +63,7 @@ class S3Store : public IObjectStore {
   private:
     const S3StoreConfig config_;
     bool endpointValid_ = false;  // config_.endpoint passed Parse
-    std::string scheme_;          // of a custom endpoint: "http" or "https"
-    std::string hostPort_;        // of a custom endpoint, as the Host header: "127.0.0.1:9000"
+    std::string endpoint_;        // its normal form
     SigV4Signer signer_;
     void* multi_ = nullptr;  // CURLM*, kept out of this header
     std::atomic<bool> cancelled_{false};
