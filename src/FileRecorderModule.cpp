@@ -1,9 +1,20 @@
 #include "src/FileRecorderModule.h"
 
+#include <boost/chrono.hpp>
+
 #include "platform/logger/Logger.h"
+#include "src/DataController.h"
+#include "src/DataUploader.h"
+#include "src/FileBuffer.h"
+#include "src/NalAnalyzer.h"
 #include "src/ProcessControl.h"
+#include "src/StreamBuffer.h"
+#include "src/TimeManager.h"
 
 namespace Orvane {
+namespace {
+constexpr const char* kFile = "src/FileRecorderModule";
+}
 
 FileRecorderModule::FileRecorderModule() = default;
 
@@ -57,14 +68,98 @@ void FileRecorderModule::ProcessMeta(std::shared_ptr<StreamData> sample) {
 }
 
 void FileRecorderModule::Connect(ProcessControl* processControl, ModuleSettings settings) {
+    if (connected_) {
+        // One reply per connection: a repeated one must never replace running components.
+        Logger::Put(4, kFile, "Orvane::FileRecorderModule::Connect", __LINE__,
+                    "connection reply while connected: ignored.");
+        return;
+    }
     processControl_ = processControl;
     settings_ = std::move(settings);
-    // The pipeline's components are wired here once they exist.
+    INotifyObserver* observer = processControl_;  // null stays null
+
+    auto timeManager = std::make_shared<TimeManager>();
+    // Multiplied as signed 32-bit integers, as the limit always was (wraps, never widens).
+    int32_t fullSize = static_cast<int32_t>(static_cast<uint32_t>(settings_.bufferFullSize) *
+                                            static_cast<uint32_t>(settings_.uploadInterval) * 1000u);
+    auto fileBuffer = std::make_shared<FileBuffer>(fullSize);
+    auto transfer = transferFactory_ ? transferFactory_() : VqStreamFileTransfer::CreateInterface();
+    auto dataUploader = std::make_shared<DataUploader>(std::move(transfer));
+    int codecType = static_cast<int>(settings_.codecType);
+    auto nalAnalyzer = std::make_shared<NalAnalyzer>(codecType);
+    auto streamBuffer =
+        std::make_shared<StreamBuffer>(observer, fileBuffer, timeManager, nalAnalyzer, settings_);
+    auto dataController =
+        std::make_shared<DataController>(observer, fileBuffer, timeManager, dataUploader, settings_);
+    std::optional<AwsInfo> pending;
+    {
+        std::lock_guard<std::mutex> lock(componentsMutex_);
+        timeManager_ = timeManager;
+        fileBuffer_ = fileBuffer;
+        dataUploader_ = dataUploader;
+        nalAnalyzer_ = nalAnalyzer;
+        streamBuffer_ = streamBuffer;
+        dataController_ = dataController;
+        pending.swap(pendingAwsInfo_);
+    }
+    if (pending) dataController->SetAwsInfo(*pending);
+
+    {
+        boost::lock_guard<boost::mutex> lock(mutex_);
+        dataReceived_ = false;
+        stopRequested_ = false;
+    }
+    startThread_ = std::make_shared<std::thread>(&FileRecorderModule::WaitForStart, this);
+    connected_ = true;
+    streamBuffer->Start();
+    dataController->Start();
 }
 
-void FileRecorderModule::Disconnect() {}
+void FileRecorderModule::Disconnect() {
+    {
+        boost::lock_guard<boost::mutex> lock(mutex_);
+        if (stopRequested_) return;
+        stopRequested_ = true;
+    }
+    condition_.notify_all();
+    if (startThread_ && startThread_->joinable()) startThread_->join();
+    std::shared_ptr<IStreamBuffer> buffer;
+    std::shared_ptr<IDataController> controller;
+    {
+        std::lock_guard<std::mutex> lock(componentsMutex_);
+        buffer = streamBuffer_;
+        controller = dataController_;
+    }
+    if (buffer) buffer->Stop();
+    if (controller) controller->Stop();
+    connected_ = false;
+}
 
-void FileRecorderModule::WaitForStart() {}
+void FileRecorderModule::WaitForStart() {
+    Logger::Put(11, nullptr, nullptr, 0, "ST: wait for data receive");
+    boost::unique_lock<boost::mutex> lock(mutex_);
+    condition_.wait(lock, [this] { return stopRequested_ || dataReceived_; });
+    if (!stopRequested_) {
+        Logger::Put(11, nullptr, nullptr, 0, "ST: data receive event detected");
+        dataReceived_ = false;
+        auto deadline = boost::chrono::steady_clock::now() +
+                        boost::chrono::milliseconds(settings_.startIgnoreTime);
+        while (!stopRequested_) {
+            if (condition_.wait_until(lock, deadline) == boost::cv_status::timeout) break;
+        }
+        if (!stopRequested_) {
+            Logger::Put(11, nullptr, nullptr, 0, "ST: start filing");
+            filing_ = true;
+            return;
+        }
+    }
+    Logger::Put(11, nullptr, nullptr, 0, "ST: stop event detected");
+}
+
+void FileRecorderModule::SetTransferFactory(
+    std::function<std::shared_ptr<IFileTransfer>()> factory) {
+    transferFactory_ = std::move(factory);
+}
 
 void FileRecorderModule::SetAwsInfo(const AwsInfo& info) {
     std::shared_ptr<IDataController> controller;

@@ -12,6 +12,7 @@
 
 #include <boost/thread/condition_variable.hpp>
 #include <boost/thread/mutex.hpp>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -56,6 +57,10 @@ public:
     // Stops the stream buffer (module error path); no-op before Connect.
     void StopStreamBuffer();
 
+    // Where Connect gets its transfer interface; VqStreamFileTransfer::CreateInterface unless
+    // a test installs another. Call before Connect.
+    void SetTransferFactory(std::function<std::shared_ptr<IFileTransfer>()> factory);
+
 private:
     bool IsWaitingForStart();
     void WaitForStart();
@@ -79,6 +84,7 @@ private:
     mutable std::mutex componentsMutex_;  // guards the component pointers and pendingAwsInfo_
     std::optional<AwsInfo> pendingAwsInfo_;  // credentials that came before Connect
     bool connected_ = false;  // between Connect and Disconnect (message thread)
+    std::function<std::shared_ptr<IFileTransfer>()> transferFactory_;
 };
 
 }  // namespace Orvane
