@@ -153,3 +153,5 @@ void BaseProcess::stopProcess() {}
 bool BaseProcess::startProcess() { return true; }
 
 bool BaseProcess::setProperties(std::map<std::string, std::string>&) { return true; }
+
+bool BaseProcess::drainProcess(int64_t) { return true; }

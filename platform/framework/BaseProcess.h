@@ -14,6 +14,7 @@
 // Status and send calls are safe for concurrent callers.
 #pragma once
 
+#include <cstdint>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -95,6 +96,11 @@ public:
     virtual void stopProcess();
     virtual bool startProcess();
     virtual bool setProperties(std::map<std::string, std::string>& properties);
+    // End of stream (the host's message thread): the input ended or the user asked to stop.
+    // The module stores what it still holds, waiting at most `timeoutMs`; true when all was
+    // stored in time. The host then delivers the disconnection request as usual. The base
+    // has nothing to store and returns true at once.
+    virtual bool drainProcess(int64_t timeoutMs);
 
     // Sample hooks (receive threads): the base drops the samples.
     void notifyVideoData(std::shared_ptr<ReceivedSample>) override {}
