@@ -199,7 +199,9 @@ TEST_F(S3StoreTest, StoresObjectsByteIdenticalWithMetadata) {
     ASSERT_EQ(store.Put(Object(key, body), Credentials(), &info), Success);
     EXPECT_EQ(info.fileSize, body.size());
     const std::string body2 = RandomBytes(1000, 2);
-    ASSERT_EQ(store.Put(Object("cam1/second.ts", body2), Credentials(), &info), Success);
+    ObjectToStore second = Object("cam1/second.ts", body2);
+    second.metadata["empty"] = "";  // signed and sent as an empty header
+    ASSERT_EQ(store.Put(second, Credentials(), &info), Success);
     EXPECT_EQ(info.fileSize, body2.size());
 
     const std::string copy = testsupport::BuildPath("s3store-copy-" + std::to_string(getpid()));
@@ -308,6 +310,8 @@ TEST_F(S3StoreTest, RequestHeadersAndScriptedAnswers) {
     sneaky.metadata["note"] = "x\r\nx-amz-acl: public-read";
     ASSERT_EQ(store.Put(sneaky, Credentials(), &info), Success);
     EXPECT_EQ(ok.Request().find("\r\nx-amz-acl"), std::string::npos);
+    EXPECT_NE(ok.Request().find("\r\nx-amz-meta-note: x__x-amz-acl: public-read\r\n"),
+              std::string::npos);
 
     struct Case {
         std::string answer;

@@ -5,6 +5,7 @@
 #include <cctype>
 #include <cstring>
 #include <mutex>
+#include <set>
 #include <utility>
 #include <vector>
 
@@ -310,8 +311,11 @@ FileTransferResult S3Store::Put(const ObjectToStore& object, const StoreCredenti
     if (!credentials.sessionToken.empty()) {
         request.headers.emplace_back("x-amz-security-token", HeaderValue(credentials.sessionToken));
     }
+    std::set<std::string> metadataNames;  // two names may fold into one; the first one wins
     for (const auto& [name, value] : object.metadata) {
-        request.headers.emplace_back("x-amz-meta-" + MetadataName(name), HeaderValue(value));
+        std::string header = "x-amz-meta-" + MetadataName(name);
+        if (name.empty() || !metadataNames.insert(header).second) continue;
+        request.headers.emplace_back(header, HeaderValue(value));
     }
     SigV4Key key{credentials.accessKey, credentials.secretKey, target.signingRegion, "s3"};
     const SigV4Signature signature = SigV4Signer::Sign(request, key, amzDate);
@@ -320,7 +324,11 @@ FileTransferResult S3Store::Put(const ObjectToStore& object, const StoreCredenti
 
     CurlSlist headers;
     bool headersOk = headers.Add("Expect:");  // no 100-continue round trip
-    for (const auto& [name, value] : request.headers) headersOk &= headers.Add(name + ": " + value);
+    for (const auto& [name, value] : request.headers) {
+        // curl drops a header written "name:" with nothing after it, but sends "name;" as an
+        // empty one; the signature covers it either way.
+        headersOk &= headers.Add(value.empty() ? name + ";" : name + ": " + value);
+    }
     headersOk &= headers.Add("Authorization: " + signature.authorization);
 
     CURL* easy = curl_easy_init();
