@@ -384,6 +384,10 @@ TEST(CrashReportRecorder, KillSegvLeavesAReportBesideTheExecutable) {
                                 "-bufferfullsize", "100", "-kct", "h264", "-status", fifo},
                                {"ASAN_OPTIONS=handle_segv=0"});
     ASSERT_TRUE(WaitUntil([&] { return CatchesSegv(pid, recorder.Program()); }, 30000));
+    // Then let it reach the blocking open (the kernel names the wait); where wchan is not
+    // shown, the deadline gives it ample time to get there.
+    std::string wchan = "/proc/" + std::to_string(pid) + "/wchan";
+    WaitUntil([&] { return ReadFile(wchan) == "wait_for_partner"; }, 10000);
     ASSERT_EQ(kill(pid, SIGSEGV), 0);
     Ending ending = recorder.Wait(pid);
     EXPECT_EQ(ending.Signal(), SIGSEGV) << ending.output;
