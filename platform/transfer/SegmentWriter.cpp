@@ -87,23 +87,35 @@ struct Track {
 
 // The times of one sample in 90 kHz ticks without the run's offset; false when the sample has
 // no usable clock or times.
-bool sampleTimes(const StreamData& sample, const TrackDescription* description, int64_t* pts,
-                 int64_t* dts) {
+bool sampleTimes(const StreamData& sample, TrackDescription::Kind kind,
+                 const TrackDescription* description, int64_t* pts, int64_t* dts) {
     uint32_t clock = sample.attribute5;
     if (clock == 0 && description) clock = description->clockRate;
+    if (clock == 0 && kind != TrackDescription::Kind::Audio) clock = kTicksPerSecond;
     if (clock == 0 || clock > static_cast<uint32_t>(INT_MAX)) return false;
     const AVRational from{1, static_cast<int>(clock)};
     const AVRational to{1, static_cast<int>(kTicksPerSecond)};
     const auto rounding = static_cast<AVRounding>(AV_ROUND_NEAR_INF | AV_ROUND_PASS_MINMAX);
     *pts = av_rescale_q_rnd(static_cast<int64_t>(sample.rtpTime), from, to, rounding);
     *dts = av_rescale_q_rnd(static_cast<int64_t>(sample.attribute2), from, to, rounding);
-    return *pts > -kTimeLimit && *pts<kTimeLimit&& * dts> - kTimeLimit && *dts < kTimeLimit;
+    auto inRange = [](int64_t t) { return t > -kTimeLimit && t < kTimeLimit; };
+    return inRange(*pts) && inRange(*dts);
 }
 
-bool usablePayload(const StreamData& sample) {
+// Whether the muxer can take the payload without reading past its end. Our packets carry no
+// padding, and the mpegts muxer reads the first four bytes of any H.264/H.265 access unit that
+// does not begin with a start code (for a log line), so such units, which are not Annex B and
+// thus malformed anyway, never reach it.
+bool usablePayload(const StreamData& sample, AVCodecID codec) {
+    const uint8_t* data = sample.PayloadData();
     size_t bytes = sample.PayloadBytes();
-    return sample.PayloadData() != nullptr && bytes > 0 &&
-           bytes <= static_cast<size_t>(INT_MAX - AV_INPUT_BUFFER_PADDING_SIZE);
+    if (!data || bytes == 0 || bytes > static_cast<size_t>(INT_MAX - AV_INPUT_BUFFER_PADDING_SIZE))
+        return false;
+    if (codec != AV_CODEC_ID_H264 && codec != AV_CODEC_ID_HEVC) return true;
+    if (bytes < 5) return false;
+    const bool startCode4 = data[0] == 0 && data[1] == 0 && data[2] == 0 && data[3] == 1;
+    const bool startCode3 = data[0] == 0 && data[1] == 0 && data[2] == 1;
+    return startCode4 || startCode3;
 }
 
 // Sets the stream's codec parameters from the track description, or from its codec name when
@@ -176,30 +188,6 @@ bool SegmentWriter::Write(const std::vector<StreamData>& video,
             if (!track.description && sample.source)
                 track.description = sample.source->Track().get();
         }
-    }
-
-    // The run's origin: the earliest decode time among the first usable samples of the first
-    // object lands on kRunOrigin90k. Later objects reuse the same offset.
-    if (!hasOffset_) {
-        bool found = false;
-        int64_t earliest = 0;
-        for (Track& track : tracks) {
-            for (const StreamData& sample : *track.samples) {
-                int64_t pts = 0, dts = 0;
-                if (!usablePayload(sample) || !sampleTimes(sample, track.description, &pts, &dts))
-                    continue;
-                if (!found || dts < earliest) earliest = dts;
-                found = true;
-                break;
-            }
-        }
-        if (!found) {
-            report->dropped = video.size() + audio.size() + meta.size();
-            *error = "no sample has a payload and usable times";
-            return false;
-        }
-        offset90k_ = kRunOrigin90k - earliest;
-        hasOffset_ = true;
     }
 
     Muxer muxer;
@@ -279,6 +267,32 @@ bool SegmentWriter::Write(const std::vector<StreamData>& video,
         *error = "no track can be written";
         return false;
     }
+    // The run's origin: the earliest decode time among the first usable samples of the first
+    // object lands on kRunOrigin90k. Later objects reuse the same offset.
+    if (!hasOffset_) {
+        bool found = false;
+        int64_t earliest = 0;
+        for (Track& track : tracks) {
+            if (!track.stream) continue;
+            for (const StreamData& sample : *track.samples) {
+                int64_t pts = 0, dts = 0;
+                if (!usablePayload(sample, track.codec) ||
+                    !sampleTimes(sample, track.kind, track.description, &pts, &dts))
+                    continue;
+                if (!found || dts < earliest) earliest = dts;
+                found = true;
+                break;
+            }
+        }
+        if (!found) {
+            report->dropped = video.size() + audio.size() + meta.size();
+            *error = "no sample has a payload and usable times";
+            return false;
+        }
+        offset90k_ = kRunOrigin90k - earliest;
+        hasOffset_ = true;
+    }
+
     rc = avformat_write_header(context, nullptr);
     if (rc < 0) {
         *error = "cannot start the TS object: " + avError(rc);
@@ -296,8 +310,8 @@ bool SegmentWriter::Write(const std::vector<StreamData>& video,
             while (track.next < track.samples->size()) {
                 const StreamData& sample = (*track.samples)[track.next];
                 int64_t pts = 0, dts = 0;
-                bool usable =
-                    usablePayload(sample) && sampleTimes(sample, track.description, &pts, &dts);
+                bool usable = usablePayload(sample, track.codec) &&
+                              sampleTimes(sample, track.kind, track.description, &pts, &dts);
                 if (usable) {
                     pts += offset90k_;
                     dts += offset90k_;

@@ -9,7 +9,8 @@
 // Sample contract (what the media host puts into the attribute block):
 //   rtpTime     presentation time in the track's media clock
 //   attribute2  decode time in the track's media clock
-//   attribute5  the media clock rate in Hz (0: the track description's clockRate)
+//   attribute5  the media clock rate in Hz (0: the track description's clockRate; without
+//               either, 90 kHz for video and meta, and audio is unusable)
 // Both times are read as signed 64-bit values, so a host may hand over the negative start times
 // of MP4 input (AAC priming, B-frame delay) in two's complement. Each sample's track comes from
 // `source->Track()`: its codecParameters (an AVCodecParameters*) when present, else the codec
