@@ -1,5 +1,6 @@
 #include "src/DataController.h"
 
+#include <algorithm>
 #include <boost/chrono.hpp>
 
 #include "platform/logger/Logger.h"
@@ -61,6 +62,7 @@ void DataController::Stop() {
         boost::lock_guard<boost::mutex> lock(mutex_);
         stop_ = true;
     }
+    progress_.notify_all();
     {
         std::lock_guard<std::mutex> stopLock(stopMutex_);
         if (uploadThread_.joinable()) {
@@ -103,6 +105,10 @@ void DataController::fileUpload() {
     while (!stopped()) {
         FileTransferRequest request = PopStreamFile(sequenceNumber);
         if (stopped()) break;
+        {
+            boost::lock_guard<boost::mutex> lock(mutex_);
+            inHandDuration_ = request.duration;
+        }
 
         const uint32_t duration = request.duration;
         bool succeeded = false;
@@ -182,11 +188,54 @@ void DataController::fileUpload() {
             notifySequence(sequenceNumber, succeeded, errorName, duration);
             notifyUploadInfo(sequenceNumber, info, result);
             ++sequenceNumber;
+            fileDone(true);
             if (!stopNow) deleteOverFileBuffer(sequenceNumber);
         }
         // `request` (and with it the file's samples) is released here.
     }
+    {
+        boost::lock_guard<boost::mutex> lock(mutex_);
+        threadEnded_ = true;
+        inHandDuration_ = 0;
+    }
+    progress_.notify_all();
     Logger::Put(11, kFile, fn, __LINE__, "fileUpload exit.");
+}
+
+void DataController::fileDone(bool wasInHand) {
+    {
+        boost::lock_guard<boost::mutex> lock(mutex_);
+        ++filesDone_;
+        if (wasInHand) inHandDuration_ = 0;
+    }
+    progress_.notify_all();
+}
+
+bool DataController::WaitForFiles(uint64_t files, std::chrono::steady_clock::time_point deadline) {
+    // The caller's deadline is on std::chrono's steady clock; the wait is on Boost's.
+    auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
+        deadline - std::chrono::steady_clock::now());
+    auto boostDeadline = boost::chrono::steady_clock::now() +
+                         boost::chrono::milliseconds(std::max<int64_t>(0, left.count()));
+    boost::unique_lock<boost::mutex> lock(mutex_);
+    while (filesDone_ < files && !threadEnded_ && !stop_) {
+        if (progress_.wait_until(lock, boostDeadline) == boost::cv_status::timeout) break;
+    }
+    return filesDone_ >= files;
+}
+
+uint64_t DataController::FilesDone() {
+    boost::lock_guard<boost::mutex> lock(mutex_);
+    return filesDone_;
+}
+
+uint64_t DataController::PendingMs() {
+    uint64_t inHand;
+    {
+        boost::lock_guard<boost::mutex> lock(mutex_);
+        inHand = inHandDuration_;
+    }
+    return fileBuffer_->GetBufferCount() + inHand;
 }
 
 FileTransferRequest DataController::PopStreamFile(int32_t sequenceNumber) {
@@ -252,6 +301,7 @@ void DataController::deleteOverFileBuffer(int32_t& sequenceNumber) {
         notifySequence(sequenceNumber, false, "BufferOver", record.duration);
         notifyUploadInfo(sequenceNumber, FileTransferInfo(), OtherError);
         ++sequenceNumber;
+        fileDone(false);
     }
 }
 

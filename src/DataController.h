@@ -43,6 +43,9 @@ public:
     void Start() override;
     void Stop() override;
     void SetAwsInfo(AwsInfo info) override;
+    bool WaitForFiles(uint64_t files, std::chrono::steady_clock::time_point deadline) override;
+    uint64_t FilesDone() override;
+    uint64_t PendingMs() override;
 
 private:
     void fileUpload();
@@ -56,6 +59,8 @@ private:
     void notifySequence(int32_t sequenceNumber, bool succeeded, const std::string& errorName,
                         uint32_t duration);
     std::string resultName(FileTransferResult result) const;
+    // A file left the buffer for good (`wasInHand`: the one being uploaded, not a dropped one).
+    void fileDone(bool wasInHand);
     bool stopped();
 
     INotifyObserver* const observer_;  // not owned; may be null
@@ -74,6 +79,12 @@ private:
     boost::mutex mutex_;
     boost::condition_variable fileDurationCondition_;
     std::mutex stopMutex_;  // serialises Stop's cancel-and-join
+
+    // Progress of the upload thread, for the end-of-stream drain; guarded by mutex_.
+    uint64_t filesDone_ = 0;         // files that left the buffer for good and were reported
+    uint32_t inHandDuration_ = 0;    // ms of the file being uploaded, 0 when none
+    bool threadEnded_ = false;       // fileUpload returned
+    boost::condition_variable progress_;  // notified (all) at each of those changes
 };
 
 }  // namespace Orvane

@@ -23,8 +23,14 @@ void FileBuffer::Push(const VqStreamFileData& record) {
     const uint64_t duration = record.duration;
     // Counted before it becomes visible to Pop, so the count never drops below the queue's sum.
     bufferCount_.fetch_add(duration);
-    if (!queue_.Push(record)) bufferCount_.fetch_sub(duration);
+    if (!queue_.Push(record)) {
+        bufferCount_.fetch_sub(duration);
+    } else if (!record.IsEmpty()) {
+        filesPushed_.fetch_add(1);
+    }
 }
+
+uint64_t FileBuffer::FilesPushed() { return filesPushed_.load(); }
 
 VqStreamFileData FileBuffer::Pop() {
     VqStreamFileData record = queue_.Pop();

@@ -39,6 +39,7 @@ class FileBuffer : public IFileBuffer {
     // True, with a "Buffer Over." line (priority 5), when the count reached the full size.
     bool IsBufferFull() override;
     uint64_t GetBufferCount() override;
+    uint64_t FilesPushed() override;
 
   private:
     static constexpr uint64_t kCapacity = 2147483647;   // records; in practice unbounded
@@ -47,6 +48,7 @@ class FileBuffer : public IFileBuffer {
     BoundedQueue<VqStreamFileData> queue_;
     const uint64_t bufferFullSize_;         // ms
     std::atomic<uint64_t> bufferCount_{0};  // ms, sum of the queued durations
+    std::atomic<uint64_t> filesPushed_{0};  // non-empty records queued so far
 };
 
 }  // namespace Orvane

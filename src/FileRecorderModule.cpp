@@ -156,6 +156,31 @@ void FileRecorderModule::WaitForStart() {
     Logger::Put(11, nullptr, nullptr, 0, "ST: stop event detected");
 }
 
+FileRecorderModule::DrainResult FileRecorderModule::Drain(
+    std::chrono::steady_clock::time_point deadline) {
+    DrainResult result;
+    std::shared_ptr<IStreamBuffer> buffer;
+    std::shared_ptr<IDataController> controller;
+    std::shared_ptr<IFileBuffer> fileBuffer;
+    {
+        std::lock_guard<std::mutex> lock(componentsMutex_);
+        buffer = streamBuffer_;
+        controller = dataController_;
+        fileBuffer = fileBuffer_;
+    }
+    if (!buffer || !controller) return result;
+    FlushQueues();
+    buffer->CutRemaining();
+    const uint64_t files = fileBuffer->FilesPushed();
+    result.complete = controller->WaitForFiles(files, deadline);
+    if (!result.complete) {
+        uint64_t done = controller->FilesDone();
+        result.droppedFiles = files > done ? files - done : 0;
+        result.droppedMs = controller->PendingMs();
+    }
+    return result;
+}
+
 void FileRecorderModule::SetTransferFactory(
     std::function<std::shared_ptr<IFileTransfer>()> factory) {
     transferFactory_ = std::move(factory);

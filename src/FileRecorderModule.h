@@ -12,6 +12,7 @@
 
 #include <boost/thread/condition_variable.hpp>
 #include <boost/thread/mutex.hpp>
+#include <chrono>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -50,6 +51,19 @@ public:
     // Ends the start thread, then stops the stream buffer and the data controller. A second
     // call does nothing.
     void Disconnect();
+
+    // What an end-of-stream drain left undone.
+    struct DrainResult {
+        bool complete = true;        // everything held was stored (or given up) in time
+        uint64_t droppedFiles = 0;   // stream files still in the buffer or in hand
+        uint64_t droppedMs = 0;      // their ms of stream
+    };
+    // End of stream (message thread): waits until the workers have handed on every queued
+    // sample, has the stream buffer cut everything it holds into stream files, then waits until
+    // the upload loop has done all of them, until `deadline` at the latest. Without a connected
+    // pipeline there is nothing to do. Disconnect may come meanwhile from another thread; the
+    // drain then ends at once, incomplete.
+    DrainResult Drain(std::chrono::steady_clock::time_point deadline);
 
     // Hands credentials to the data controller; before Connect they are kept and handed over
     // when the controller is created.

@@ -19,6 +19,9 @@ public:
     // Sum of the durations of the queued files, ms.
     virtual uint64_t GetBufferCount() = 0;
     virtual ~IFileBuffer() = default;
+    // Stream files (not empty records) queued since construction, for the end-of-stream drain;
+    // a buffer that is never drained (a test double) may keep the answer 0.
+    virtual uint64_t FilesPushed() { return 0; }
 };
 
 }  // namespace Orvane

@@ -5,6 +5,7 @@
 // upload thread). Receive*: one media worker each, concurrently.
 #pragma once
 
+#include <cstdint>
 #include <memory>
 
 #include "platform/framework/StreamData.h"
@@ -22,6 +23,10 @@ public:
     // Meta before filing starts: kept in a sliding window, does not start the filing thread.
     virtual void ReceiveMetaBeforeStart(std::shared_ptr<StreamData> sample) = 0;
     virtual ~IStreamBuffer() = default;
+    // End of stream (any thread but the filing thread): cuts everything held into stream
+    // files and pushes them; the last one runs to the newest held sample, inclusive, and is
+    // pushed however short. Nothing is cut after Stop or before the first IDR.
+    virtual void CutRemaining() = 0;
 };
 
 }  // namespace Orvane

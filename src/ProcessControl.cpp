@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cctype>
+#include <chrono>
 
 #include "platform/framework/StreamData.h"
 #include "platform/logger/Logger.h"
@@ -105,6 +106,29 @@ VqResult ProcessControl::notifyInputOutputDisconnectionRequest(DisconnectInputRe
     if (module_) module_->Disconnect();
     running_ = false;
     return BaseProcess::notifyInputOutputDisconnectionRequest(request);
+}
+
+bool ProcessControl::drainProcess(int64_t timeoutMs) {
+    constexpr const char* fn = "Orvane::ProcessControl::drainProcess";
+    Logger::Put(11, kFile, fn, __LINE__, "drainProcess enter.");
+    auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
+    bool complete = true;
+    if (!running_.load() || !module_) {
+        Logger::Put(11, kFile, fn, __LINE__, "nothing to drain: the module is not running.");
+    } else {
+        auto result = module_->Drain(deadline);
+        complete = result.complete;
+        if (!complete) {
+            Logger::Put(5, kFile, fn, __LINE__,
+                        "drain incomplete after %lld ms: %llu stream files (%llu ms of stream) "
+                        "left to the disconnection, which drops them.",
+                        static_cast<long long>(timeoutMs),
+                        static_cast<unsigned long long>(result.droppedFiles),
+                        static_cast<unsigned long long>(result.droppedMs));
+        }
+    }
+    Logger::Put(11, kFile, fn, __LINE__, "drainProcess exit.");
+    return complete;
 }
 
 void ProcessControl::notifyVideoData(std::shared_ptr<ReceivedSample> sample) {

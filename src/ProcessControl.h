@@ -34,6 +34,10 @@ public:
     void stopProcess() override;
     bool startProcess() override;
     bool setProperties(std::map<std::string, std::string>& properties) override;
+    // End of stream: stores everything the module holds, with the usual upload rules, before
+    // the host disconnects; what the deadline leaves is dropped by the disconnection, and the
+    // log says how much.
+    bool drainProcess(int64_t timeoutMs) override;
 
     void notifyVideoData(std::shared_ptr<ReceivedSample> sample) override;
     void notifyAudioData(std::shared_ptr<ReceivedSample> sample) override;

@@ -73,6 +73,8 @@ class StreamBuffer : public IStreamBuffer {
     void ReceiveMeta(std::shared_ptr<StreamData> sample) override;
     // Keeps meta within 180000 rtpTime units of the newest; does not release the filing thread.
     void ReceiveMetaBeforeStart(std::shared_ptr<StreamData> sample) override;
+    // Under the filing mutex, so never in the middle of a tick (StreamBufferDrain.cpp).
+    void CutRemaining() override;
 
   private:
     friend class StreamBufferProbe;
@@ -115,6 +117,8 @@ class StreamBuffer : public IStreamBuffer {
     void takeListBelow(std::mutex& lock, SampleList& list, std::vector<StreamData>& out,
                        uint64_t cut, const char* doneMessage);
     void dumpStreamFile(const VqStreamFileData& file);
+    // Newest held timestamp over the three lists; false when nothing is held.
+    bool newestHeld(uint64_t& newest);
 
     // Collaborators, fixed at construction.
     INotifyObserver* const observer_;  // not owned, may be null
@@ -157,6 +161,7 @@ class StreamBuffer : public IStreamBuffer {
     boost::condition_variable tickWait_;
     std::thread filingThread_;
     std::mutex lifecycleMutex_;  // serialises Start and Stop (and the join)
+    bool filingStarted_ = false;  // guarded by filingMutex_: the thread left its data wait
 };
 
 }  // namespace Orvane

@@ -39,6 +39,7 @@ void StreamBuffer::createStreamFile() {
     {
         boost::unique_lock<boost::mutex> lock(filingMutex_);
         dataWait_.wait(lock, [this] { return stop_.load() || dataReceived_.load(); });
+        filingStarted_ = true;  // the interval and limits above are set from now on
     }
     // Wall time counts from the first sample on.
     const uint32_t startTick = timeManager_->GetTime();

@@ -263,6 +263,89 @@ TEST(FileRecorderModulePipeline, StreamBecomesNumberedFilesCutBeforeIdrs) {
     EXPECT_EQ(p.transfer->RequestCount(), 4u);  // the held tail is dropped by a disconnection
 }
 
+TEST(FileRecorderModuleDrain, EndOfStreamStoresTheTailToTheLastSample) {
+    LogCapture log;
+    Pipeline p({"-uploadinterval", "2", "-bufferfullsize", "10"});
+    p.Connect();
+    p.h.Host().SetProperties(kCredentials);
+    p.h.Host().Meta(testsupport::MakeReceived(0, 0, "opens the gate"));
+    ASSERT_TRUE(WaitUntil([&] { return log.Contains("ST: start filing"); }));
+    p.Stream(0, 5000, 1000);
+    EXPECT_TRUE(p.h.Process().drainProcess(20000));
+    // Everything was reported when the drain returned.
+    auto requests = p.transfer->Requests();
+    ASSERT_EQ(requests.size(), 3u);
+    EXPECT_EQ(p.h.Host().SequenceNotifies().size(), 3u);
+    const auto& last = requests[2];
+    EXPECT_EQ(last.sequenceNumber, 3);
+    EXPECT_TRUE(isIdr(last.video.front()));
+    EXPECT_EQ(last.video.front().timestamp, 4000u);
+    EXPECT_EQ(last.video.back().timestamp, 4966u);   // the input's last frame
+    EXPECT_EQ(last.audio.back().timestamp, 4980u);   // and its last audio frame
+    uint32_t total = 0;
+    for (const auto& r : requests) total += r.duration;
+    EXPECT_EQ(total, 4981u);  // to the newest sample, inclusive
+    EXPECT_EQ(p.h.Host().SequenceNotifies()[2].entries[0].duration, last.duration);
+    EXPECT_TRUE(p.h.Host().SequenceNotifies()[2].entries[0].succeeded);
+    p.h.Host().Disconnection();
+}
+
+TEST(FileRecorderModuleDrain, NothingHeldReturnsAtOnce) {
+    Pipeline p;
+    p.Connect();
+    auto start = std::chrono::steady_clock::now();
+    EXPECT_TRUE(p.h.Process().drainProcess(30000));
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(2));
+    EXPECT_EQ(p.transfer->RequestCount(), 0u);
+}
+
+TEST(FileRecorderModuleDrain, AStoreThatIsDownEndsAtTheDeadlineNamingWhatIsDropped) {
+    LogCapture log;
+    Pipeline p({"-uploadinterval", "2", "-bufferfullsize", "10"});
+    p.transfer->SetFallback(NetworkError);
+    p.Connect();
+    p.h.Host().SetProperties(kCredentials);
+    p.h.Host().Meta(testsupport::MakeReceived(0, 0, "opens the gate"));
+    ASSERT_TRUE(WaitUntil([&] { return log.Contains("ST: start filing"); }));
+    p.Stream(0, 5000, 1000);
+    auto start = std::chrono::steady_clock::now();
+    EXPECT_FALSE(p.h.Process().drainProcess(800));
+    auto took = std::chrono::steady_clock::now() - start;
+    EXPECT_GE(took, std::chrono::milliseconds(700));
+    EXPECT_LT(took, std::chrono::seconds(10));
+    bool named = false;
+    for (const auto& r : log.Records()) {
+        if (r.message.rfind("drain incomplete after 800 ms: 3 stream files (4981 ms of stream)", 0) == 0) {
+            named = true;
+            EXPECT_EQ(r.priority, 5);
+        }
+    }
+    EXPECT_TRUE(named);
+    auto disconnectStart = std::chrono::steady_clock::now();
+    p.h.Host().Disconnection();  // drops them, as a disconnection does
+    EXPECT_LT(std::chrono::steady_clock::now() - disconnectStart, std::chrono::seconds(5));
+    EXPECT_TRUE(p.h.Host().SequenceNotifies().empty());
+}
+
+TEST(FileRecorderModuleConcurrency, DrainRacesDisconnectionAndModuleError) {
+    for (int round = 0; round < 5; ++round) {
+        LogCapture log;
+        Pipeline p({"-uploadinterval", "1", "-bufferfullsize", "10"});
+        p.Connect();
+        p.h.Host().SetProperties(kCredentials);
+        p.h.Host().Meta(testsupport::MakeReceived(0, 0, "opens the gate"));
+        ASSERT_TRUE(WaitUntil([&] { return log.Contains("ST: start filing"); }));
+        p.Stream(0, 1500, 500);
+        std::thread drain([&] { p.h.Process().drainProcess(5000); });
+        std::thread error([&] { p.h.Process().notifyModuleError(21); });
+        std::thread disconnect([&] { p.h.Host().Disconnection(); });
+        drain.join();
+        error.join();
+        disconnect.join();
+        p.h.Process().stopProcess();
+    }
+}
+
 TEST(FileRecorderModuleConcurrency, ModuleErrorAndDisconnectionStopTheBufferTogether) {
     for (int round = 0; round < 10; ++round) {
         Pipeline p;
