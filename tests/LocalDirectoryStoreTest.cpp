@@ -166,7 +166,7 @@ TEST_F(LocalDirectoryStoreTest, CancelEndsARunningPutAndEveryLaterOne) {
     FileTransferInfo info;
     // Cancel while a large object is being written: the Put ends with TimeOut (or had already
     // stored it whole), and no temporary file stays behind.
-    std::string big(512 << 20, 'x');
+    std::string big(128 << 20, 'x');
     std::atomic<bool> started{false};
     FileTransferResult running = Success;
     std::thread writer([&] {
