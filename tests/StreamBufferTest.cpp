@@ -230,8 +230,9 @@ TEST(StreamBufferCut, CutsBeforeTheLastIdrAtOrBeforeTheBoundary) {
     ASSERT_EQ(file.meta.size(), 60u);
     EXPECT_EQ(file.meta.back().timestamp, 59000u);
     EXPECT_TRUE(rig.log.Contains("ST: V:1800, A:3000, M:60, d:59999, max:59999 "));
-    EXPECT_TRUE(rig.log.Contains("ST: DUMP LEN [59999, 0]."));
-    EXPECT_TRUE(rig.log.Contains("DUMP: [V] [1800, 0 - 5396940/5396940(59966)]."));
+    // The dump lines follow the push.
+    EXPECT_TRUE(rig.WaitLog("ST: DUMP LEN [59999, 0]."));
+    EXPECT_TRUE(rig.WaitLog("DUMP: [V] [1800, 0 - 5396940/5396940(59966)]."));
 
     // The next boundary moves on from the cut: 59999 + 60000.
     stream.FeedUntil(119999);
@@ -245,7 +246,7 @@ TEST(StreamBufferCut, CutsBeforeTheLastIdrAtOrBeforeTheBoundary) {
     ASSERT_FALSE(file.meta.empty());
     EXPECT_EQ(file.meta.front().timestamp, 59999u);
     EXPECT_EQ(file.video.front().timestamp, 60000u);
-    EXPECT_TRUE(rig.log.Contains("ST: DUMP LEN [60000, 59999]."));
+    EXPECT_TRUE(rig.WaitLog("ST: DUMP LEN [60000, 59999]."));
 }
 
 TEST(StreamBufferCut, LongGopsEndTheFileEarlier) {
@@ -427,6 +428,7 @@ TEST(StreamBufferFiling, CatchesUpAfterAGapWithOneIntervalPerFileInOneTick) {
     EXPECT_EQ(files[12].audio.size(), 50u);
 
     // All in the one tick that was held: no tick line between the first and the last file.
+    ASSERT_TRUE(rig.WaitLog("ST: DUMP LEN [1000, 12000]."));
     const auto after = rig.MessagesAfter("ST: DUMP LEN [1000, 0].");
     auto last = std::find(after.begin(), after.end(), "ST: DUMP LEN [1000, 12000].");
     ASSERT_NE(last, after.end());
