@@ -1,0 +1,220 @@
+#include "platform/framework/MediaHost.h"
+
+extern "C" {
+#include <libavutil/mathematics.h>
+}
+
+#include <algorithm>
+#include <csignal>
+
+#include "platform/framework/Credentials.h"
+#include "platform/framework/Pacer.h"
+#include "platform/framework/SignalHandling.h"
+#include "platform/logger/Logger.h"
+
+namespace {
+
+constexpr const char* kFile = "platform/framework/MediaHost";
+
+// µs on the shared clock → the track's media clock, in two's complement when negative.
+uint64_t toMediaClock(int64_t micros, uint32_t clockRate) {
+    return static_cast<uint64_t>(
+        av_rescale_rnd(micros, clockRate, 1000000, static_cast<AVRounding>(AV_ROUND_NEAR_INF)));
+}
+
+}  // namespace
+
+MediaHost::MediaHost(FrameworkOptions options, bool handleSignals)
+    : options_(std::move(options)),
+      live_(MediaInput::IsLive(options_.input)),
+      handleSignals_(handleSignals),
+      shownInput_(MediaInput::Redacted(options_.input)) {}
+
+MediaHost::~MediaHost() {
+    Stop();
+    if (receiver_.joinable()) receiver_.join();
+}
+
+void MediaHost::Stop() {
+    stop_.Raise();
+}
+
+bool MediaHost::Prepare(BaseProcess& process) {
+    process_ = &process;
+    input_ = std::make_unique<MediaInput>(options_.input, live_, stop_);
+    std::string error;
+    if (!input_->Open(&error)) {
+        Logger::Put(4, kFile, "MediaHost::Prepare", __LINE__, "%s", error.c_str());
+        input_.reset();
+        return false;
+    }
+    realStartMicros_ = input_->RealStartMicros();
+    Logger::Put(11, kFile, "MediaHost::Prepare", __LINE__, "recording %s input \"%s\"",
+                live_ ? "live" : "file", shownInput_.c_str());
+    return true;
+}
+
+void MediaHost::Run(BaseProcess& process) {
+    constexpr const char* fn = "MediaHost::Run";
+    std::unique_ptr<SignalHandling> signals;
+    if (handleSignals_) {
+        signals = std::make_unique<SignalHandling>([this](int signo) {
+            Logger::Put(11, kFile, "MediaHost::Run", __LINE__,
+                        "%s received: storing what is held, then ending (send it again to end "
+                        "at once)",
+                        signo == SIGINT ? "SIGINT" : "SIGTERM");
+            Stop();
+        });
+    }
+
+    ConnectResponse reply;
+    process.notifyModuleConnectionRequestReply(reply);
+    deliverCredentials(process, "after the connection reply");
+
+    if (input_) {
+        receiver_ = std::thread([this, &process] { receive(process); });
+        receiver_.join();
+    }
+    Logger::Put(11, kFile, fn, __LINE__,
+                "input ends (%s): %llu samples delivered, %llu packets without timestamp "
+                "dropped, %llu clock jumps re-based",
+                endReason_.empty() ? "stopped" : endReason_.c_str(),
+                static_cast<unsigned long long>(delivered_),
+                static_cast<unsigned long long>(clock_.DroppedWithoutTimestamp()),
+                static_cast<unsigned long long>(clock_.Rebases()));
+
+    const auto timeoutMs = static_cast<int64_t>(options_.drainTimeoutSeconds * 1000.0);
+    Logger::Put(11, kFile, fn, __LINE__, "end of stream: storing what is held (at most %lld ms)",
+                static_cast<long long>(timeoutMs));
+    if (process.drainProcess(timeoutMs)) {
+        Logger::Put(11, kFile, fn, __LINE__, "end of stream: all held samples were stored");
+    } else {
+        Logger::Put(5, kFile, fn, __LINE__,
+                    "end of stream: not everything held was stored within %lld ms",
+                    static_cast<long long>(timeoutMs));
+    }
+    input_.reset();
+    // `signals` ends here: from now on a signal takes its previous action again, except that
+    // one that arrives while the handlers are still installed counts as the second.
+}
+
+void MediaHost::OnTokenRequest(const GetAWSSecureTokenRequest&) {
+    if (process_) deliverCredentials(*process_, "on a token request");
+}
+
+void MediaHost::deliverCredentials(BaseProcess& process, const char* occasion) {
+    constexpr const char* fn = "MediaHost::deliverCredentials";
+    credentials::Result credentials = credentials::Fetch(options_);
+    if (!credentials.ok) {
+        Logger::Put(5, kFile, fn, __LINE__, "no credentials to hand over %s: %s", occasion,
+                    credentials.why.c_str());
+        return;
+    }
+    Logger::Put(12, kFile, fn, __LINE__, "credentials from the %s handed over %s",
+                credentials.source.c_str(), occasion);
+    process.setProperties(credentials.properties);
+}
+
+bool MediaHost::reopen(std::string why) {
+    constexpr const char* fn = "MediaHost::reopen";
+    input_.reset();
+    while (true) {
+        Logger::Put(5, kFile, fn, __LINE__, "input \"%s\": %s; reopening in %lld s",
+                    shownInput_.c_str(), why.c_str(), static_cast<long long>(reopenPause_.count()));
+        if (stop_.WaitUntil(std::chrono::steady_clock::now() + reopenPause_)) return false;
+        // The pause grows with every attempt until a reopened input delivers again.
+        reopenPause_ = std::min(reopenPause_ * 2, kLongestReopenPause);
+        auto input = std::make_unique<MediaInput>(options_.input, live_, stop_);
+        if (input->Open(&why)) {
+            input_ = std::move(input);
+            Logger::Put(11, kFile, fn, __LINE__, "input \"%s\" reopened", shownInput_.c_str());
+            return true;
+        }
+        if (stop_.Raised()) return false;
+    }
+}
+
+void MediaHost::receive(BaseProcess& process) {
+    constexpr const char* fn = "MediaHost::receive";
+    Pacer pacer(live_ ? 0.0 : (options_.readRate < 0 ? 1.0 : options_.readRate), stop_);
+    const bool limited = options_.durationSeconds >= 0;
+    const auto limitUs = static_cast<int64_t>(options_.durationSeconds * 1e6);
+    MediaInput::Packet packet;
+    while (true) {
+        std::string error;
+        MediaInput::Status status = input_->Read(&packet, &error);
+        if (status == MediaInput::Status::kStopped) {
+            endReason_ = "stopped";
+            return;
+        }
+        if (status == MediaInput::Status::kEnd || status == MediaInput::Status::kFailed) {
+            if (!live_) {
+                if (status == MediaInput::Status::kFailed) {
+                    Logger::Put(4, kFile, fn, __LINE__, "reading input \"%s\" failed: %s",
+                                shownInput_.c_str(), error.c_str());
+                    endReason_ = "read error";
+                } else {
+                    endReason_ = "end of file";
+                }
+                return;
+            }
+            if (!reopen(status == MediaInput::Status::kEnd ? std::string("the stream ended")
+                                                           : error)) {
+                endReason_ = "stopped";
+                return;
+            }
+            continue;
+        }
+
+        SampleClock::Times times;
+        if (!clock_.Place(packet.track, packet.hasPts, packet.ptsUs, packet.hasDts, packet.dtsUs,
+                          packet.durationUs, &times))
+            continue;
+        if (limited && times.dtsUs >= limitUs) {
+            Logger::Put(11, kFile, fn, __LINE__, "%g s of input recorded (-duration)",
+                        options_.durationSeconds);
+            endReason_ = "duration reached";
+            return;
+        }
+        if (!pacer.Pace(times.dtsUs)) {
+            endReason_ = "stopped";
+            return;
+        }
+        deliver(process, packet, times);
+        reopenPause_ = kFirstReopenPause;  // the input works again
+    }
+}
+
+void MediaHost::deliver(BaseProcess& process, const MediaInput::Packet& packet,
+                        const SampleClock::Times& times) {
+    const TrackDescription& track = *packet.description;
+    const int64_t sinceStartUs = std::max<int64_t>(times.dtsUs, 0);
+    SampleAttributes a;
+    a.rtpTime = toMediaClock(times.ptsUs, track.clockRate);
+    a.timestamp = static_cast<uint64_t>(sinceStartUs / 1000);
+    a.attribute1 = static_cast<uint64_t>(realStartMicros_ + sinceStartUs);
+    a.attribute2 = toMediaClock(times.dtsUs, track.clockRate);
+    a.attribute4 = static_cast<uint32_t>(track.trackIndex);
+    a.attribute5 = track.clockRate;
+    a.attribute6 = true;
+    a.attribute7 = packetNumbers_[packet.track]++;
+    a.payloadSize = packet.size;
+    auto sample = std::make_shared<ReceivedSample>(a.Encode(), packet.data, packet.size,
+                                                   packet.owner, packet.description);
+    ++delivered_;
+    switch (packet.track) {
+        case SampleClock::kVideo:
+            process.notifyVideoData(std::move(sample));
+            break;
+        case SampleClock::kAudio:
+            process.notifyAudioData(std::move(sample));
+            break;
+        default:
+            process.notifyMetaData(std::move(sample));
+            break;
+    }
+}
+
+std::shared_ptr<IModuleHost> CreateMediaHost(const FrameworkOptions& options) {
+    return std::make_shared<MediaHost>(options, true);
+}

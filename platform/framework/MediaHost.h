@@ -1,0 +1,79 @@
+// MediaHost: the host that records a real stream: it reads `-input` with libavformat and drives
+// the module as the media system's host would.
+//
+// Prepare (message thread, during Initialize) opens the input once, so that an input that
+// cannot be opened, or has no H.264/H.265 video, ends the start with a plain log line.
+// Run (message thread, after startProcess):
+//   1. delivers the connection reply, then the credentials once when it has them;
+//   2. starts the receive thread, which reads the input, keeps the clock sound (SampleClock),
+//      paces a file input by `-readrate` (Pacer) and calls notifyVideoData / notifyAudioData /
+//      notifyMetaData with one ReceivedSample per packet; a live input that fails or stays
+//      silent is reopened with a growing pause (1 s doubling up to 30 s) and never ends by
+//      itself;
+//   3. waits for that thread to end: the file's end, `-duration` seconds of input, the first
+//      SIGINT/SIGTERM, or Stop();
+//   4. asks the module to store what it holds (drainProcess with `-draintimeout`) and
+//      returns; Execute then delivers the disconnection request. A second SIGINT/SIGTERM ends the
+//      process at once (SignalHandling).
+// OnTokenRequest (upload thread) answers every token request with setProperties, holding no
+// lock of its own while it calls into the module.
+//
+// The attribute block of each sample: rtpTime / attribute2 the presentation / decode time in
+// the track's media clock (90 kHz for video and meta, the sample rate for audio), timestamp the
+// decode time in ms on the shared clock (never below 0), attribute1 the capture time in µs
+// since the epoch (the input's real start plus the decode time), attribute4 the track index in
+// the input, attribute5 the clock rate, attribute6 true, attribute7 the packet's number within
+// its track from 0.
+#pragma once
+
+#include <memory>
+#include <string>
+#include <thread>
+
+#include "platform/framework/BaseProcess.h"
+#include "platform/framework/MediaInput.h"
+#include "platform/framework/SampleClock.h"
+#include "platform/framework/StopSignal.h"
+
+class MediaHost : public IModuleHost {
+  public:
+    // Pauses before reopening a live input: the first, and the most it grows to.
+    static constexpr std::chrono::seconds kFirstReopenPause{1};
+    static constexpr std::chrono::seconds kLongestReopenPause{30};
+
+    // `handleSignals`: install the SIGINT/SIGTERM handlers while Run runs (the process's host
+    // does; in-process tests do not).
+    MediaHost(FrameworkOptions options, bool handleSignals);
+    ~MediaHost() override;
+
+    bool Prepare(BaseProcess& process) override;
+    void Run(BaseProcess& process) override;
+    void OnTokenRequest(const GetAWSSecureTokenRequest& request) override;
+
+    // Ends the run as the first SIGINT does (any thread, also before Run).
+    void Stop();
+
+  private:
+    void receive(BaseProcess& process);
+    // Fetches the credentials and hands them to the module; logs why when there are none.
+    void deliverCredentials(BaseProcess& process, const char* occasion);
+    void deliver(BaseProcess& process, const MediaInput::Packet& packet,
+                 const SampleClock::Times& times);
+    // Reopens the live input after `why`; false when stopped meanwhile.
+    bool reopen(std::string why);
+
+    const FrameworkOptions options_;
+    const bool live_;
+    const bool handleSignals_;
+    const std::string shownInput_;    // the input without user information, for log lines
+    BaseProcess* process_ = nullptr;  // set by Prepare, before any other thread runs
+    StopSignal stop_;
+    std::unique_ptr<MediaInput> input_;  // receive thread (message thread before it starts)
+    SampleClock clock_;                  // receive thread
+    int64_t realStartMicros_ = 0;        // capture time of the shared clock's 0, µs since epoch
+    uint64_t packetNumbers_[SampleClock::kTrackCount] = {0, 0, 0};
+    uint64_t delivered_ = 0;  // samples handed to the module
+    std::chrono::seconds reopenPause_ = kFirstReopenPause;
+    std::string endReason_;  // why reading ended; written by the receive thread before it ends
+    std::thread receiver_;
+};

@@ -1,0 +1,35 @@
+// Pacer: reads a file input at `-readrate` times real time.
+//
+// The receive thread calls Pace with each packet's decode time on the shared clock before it
+// hands the packet over; Pace blocks (a timed wait, no polling) until the wall clock has caught
+// up with that time divided by the rate. The first packet sets the start. To keep wake-ups few
+// (each costs a futex round trip), a packet that is due within kSlack goes at once: the input
+// runs at most kSlack ahead of its schedule.
+//
+// Threads: one thread (the receive thread) calls Pace; the StopSignal may be raised from any
+// thread and ends a wait at once.
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+
+#include "platform/framework/StopSignal.h"
+
+class Pacer {
+  public:
+    static constexpr std::chrono::milliseconds kSlack{20};
+
+    // `rate` <= 0: no pacing (Pace returns at once unless stopped).
+    Pacer(double rate, StopSignal& stop) : rate_(rate), stop_(stop) {}
+
+    // Waits until the packet with decode time `dtsUs` (µs, shared clock) is due. False when
+    // the stop signal was raised.
+    bool Pace(int64_t dtsUs);
+
+  private:
+    double rate_;
+    StopSignal& stop_;
+    bool started_ = false;
+    int64_t firstUs_ = 0;  // decode time of the first packet
+    std::chrono::steady_clock::time_point wallStart_;
+};
