@@ -25,8 +25,10 @@ double cpuSeconds() {
 }
 
 class NullTransfer : public IFileTransfer {
-public:
-    FileTransferResult Transfer(const FileTransferRequest&, FileTransferInfo*) override { return Success; }
+  public:
+    FileTransferResult Transfer(const FileTransferRequest&, FileTransferInfo*) override {
+        return Success;
+    }
     void Cancel() override {}
 };
 
@@ -34,15 +36,17 @@ std::shared_ptr<ReceivedSample> sample(uint64_t ms, bool idr) {
     SampleAttributes a;
     a.timestamp = ms;
     a.rtpTime = ms * 90;
-    std::string payload = idr ? std::string("\x00\x00\x00\x01\x65\x88", 6) : std::string("\x00\x00\x00\x01\x41\x9a", 6);
+    std::string payload = idr ? std::string("\x00\x00\x00\x01\x65\x88", 6)
+                              : std::string("\x00\x00\x00\x01\x41\x9a", 6);
     payload.resize(4000, 'x');
     return MakeReceivedSample(a, payload, nullptr);
 }
 
 void measure(bool feed) {
-    std::vector<std::string> args = {"bench", "-bucketname", "b", "-uploadinterval", "2",
-                                     "-authretrytime", "1000", "-bufferfullsize", "5", "-kct",
-                                     "h264", "-status", "/dev/null", "-loglevel", "4"};
+    std::vector<std::string> args = {"bench",     "-bucketname",    "b",    "-uploadinterval",
+                                     "2",         "-authretrytime", "1000", "-bufferfullsize",
+                                     "5",         "-kct",           "h264", "-status",
+                                     "/dev/null", "-loglevel",      "4"};
     std::vector<char*> argv;
     for (auto& a : args) argv.push_back(a.data());
     auto host = std::make_shared<TestHost>();
@@ -52,7 +56,8 @@ void measure(bool feed) {
     process.Module()->SetTransferFactory([] { return std::make_shared<NullTransfer>(); });
     process.startProcess();
     host->ConnectionReply();
-    host->SetProperties({{"awsAccessKey", "a"}, {"awsSecretKey", "s"}, {"sessionToken", "t"}, {"region", "r"}});
+    host->SetProperties(
+        {{"awsAccessKey", "a"}, {"awsSecretKey", "s"}, {"sessionToken", "t"}, {"region", "r"}});
     const double seconds = 5;
     double cpu0 = cpuSeconds();
     auto start = std::chrono::steady_clock::now();

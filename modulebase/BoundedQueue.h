@@ -16,7 +16,7 @@
 
 template <typename T>
 class BoundedQueue {
-public:
+  public:
     explicit BoundedQueue(uint64_t capacity)
         : capacity_(capacity), removePredicate_([](T) { return true; }) {}
 
@@ -70,7 +70,7 @@ public:
         return items_.size();
     }
 
-private:
+  private:
     std::deque<T> items_;  // oldest at the front
     const uint64_t capacity_;
     bool dropWhenFull_ = true;

@@ -8,15 +8,18 @@ Module::Module() = default;
 Module::~Module() = default;
 
 void Module::PushVideo(std::shared_ptr<StreamData> sample) {
-    if (!videoQueue_.Push(std::move(sample))) Logger::Put(5, nullptr, nullptr, 0, "queue overflow (video)");
+    if (!videoQueue_.Push(std::move(sample)))
+        Logger::Put(5, nullptr, nullptr, 0, "queue overflow (video)");
 }
 
 void Module::PushAudio(std::shared_ptr<StreamData> sample) {
-    if (!audioQueue_.Push(std::move(sample))) Logger::Put(5, nullptr, nullptr, 0, "queue overflow (audio)");
+    if (!audioQueue_.Push(std::move(sample)))
+        Logger::Put(5, nullptr, nullptr, 0, "queue overflow (audio)");
 }
 
 void Module::PushMeta(std::shared_ptr<StreamData> sample) {
-    if (!metaQueue_.Push(std::move(sample))) Logger::Put(5, nullptr, nullptr, 0, "queue overflow (meta)");
+    if (!metaQueue_.Push(std::move(sample)))
+        Logger::Put(5, nullptr, nullptr, 0, "queue overflow (meta)");
 }
 
 void Module::Restart() {
@@ -42,9 +45,8 @@ void Module::FlushQueues() {
     for (Step& step : steps) {
         step.seen = false;
         if (!step.queue.Push(marker)) continue;  // full: the worker is far behind anyway
-        step.condition.wait(lock, [&] {
-            return step.lastMarker == marker.get() || !step.running.load();
-        });
+        step.condition.wait(
+            lock, [&] { return step.lastMarker == marker.get() || !step.running.load(); });
     }
 }
 
@@ -98,16 +100,25 @@ void Module::StopThreads() {
 }
 
 void Module::workerLoop(Media media) {
-    Queue& queue = media == Media::Video ? videoQueue_ : media == Media::Audio ? audioQueue_ : metaQueue_;
-    std::atomic<bool>& running =
-        media == Media::Video ? videoRunning_ : media == Media::Audio ? audioRunning_ : metaRunning_;
+    Queue& queue = media == Media::Video   ? videoQueue_
+                   : media == Media::Audio ? audioQueue_
+                                           : metaQueue_;
+    std::atomic<bool>& running = media == Media::Video   ? videoRunning_
+                                 : media == Media::Audio ? audioRunning_
+                                                         : metaRunning_;
     while (true) {
         std::shared_ptr<StreamData> item = queue.Pop();
         if (item && item->payloadSize > 0) {
             switch (media) {
-                case Media::Video: ProcessVideo(item); break;
-                case Media::Audio: ProcessAudio(item); break;
-                case Media::Meta: ProcessMeta(item); break;
+                case Media::Video:
+                    ProcessVideo(item);
+                    break;
+                case Media::Audio:
+                    ProcessAudio(item);
+                    break;
+                case Media::Meta:
+                    ProcessMeta(item);
+                    break;
             }
         } else {
             std::lock_guard<std::mutex> lock(markerMutex_);

@@ -21,7 +21,7 @@
 #include "modulebase/ModuleInterface.h"
 
 class Module : public ModuleInterface {
-public:
+  public:
     Module();
     ~Module() override;
 
@@ -45,7 +45,7 @@ public:
     // again or before StartThreads.
     void StopThreads();
 
-private:
+  private:
     using Queue = BoundedQueue<std::shared_ptr<StreamData>>;
     enum class Media { Video, Audio, Meta };
     void workerLoop(Media media);

@@ -8,7 +8,7 @@
 class StreamData;
 
 class ModuleInterface {
-public:
+  public:
     // Enqueue one sample (producer threads). A full queue drops the sample.
     virtual void PushVideo(std::shared_ptr<StreamData> sample) = 0;
     virtual void PushAudio(std::shared_ptr<StreamData> sample) = 0;

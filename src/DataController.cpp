@@ -34,8 +34,8 @@ DataController::DataController(INotifyObserver* observer, std::shared_ptr<IFileB
         {static_cast<int32_t>(OtherError), "OtherError"},
     };
     warningCodes_ = {
-        {"TimeOut", 22},      {"AuthenticationError", 23}, {"FilePathError", 24},
-        {"FileBroken", 25},   {"NetworkError", 26},        {"RequestTimeTooSkewed", 27},
+        {"TimeOut", 22},       {"AuthenticationError", 23}, {"FilePathError", 24},
+        {"FileBroken", 25},    {"NetworkError", 26},        {"RequestTimeTooSkewed", 27},
         {"InternalError", 28},
     };
 }

@@ -33,10 +33,10 @@
 namespace Orvane {
 
 class DataController : public IDataController {
-public:
+  public:
     DataController(INotifyObserver* observer, std::shared_ptr<IFileBuffer> fileBuffer,
-                   std::shared_ptr<ITimeManager> timeManager, std::shared_ptr<IDataUploader> uploader,
-                   ModuleSettings settings);
+                   std::shared_ptr<ITimeManager> timeManager,
+                   std::shared_ptr<IDataUploader> uploader, ModuleSettings settings);
     // Stops the upload thread if the owner did not (a joinable thread must never be destroyed).
     ~DataController() override;
 
@@ -47,7 +47,7 @@ public:
     uint64_t FilesDone() override;
     uint64_t PendingMs() override;
 
-private:
+  private:
     void fileUpload();
     FileTransferRequest PopStreamFile(int32_t sequenceNumber);
     bool waitAuthenticationInfo();
@@ -81,9 +81,9 @@ private:
     std::mutex stopMutex_;  // serialises Stop's cancel-and-join
 
     // Progress of the upload thread, for the end-of-stream drain; guarded by mutex_.
-    uint64_t filesDone_ = 0;         // files that left the buffer for good and were reported
-    uint32_t inHandDuration_ = 0;    // ms of the file being uploaded, 0 when none
-    bool threadEnded_ = false;       // fileUpload returned
+    uint64_t filesDone_ = 0;              // files that left the buffer for good and were reported
+    uint32_t inHandDuration_ = 0;         // ms of the file being uploaded, 0 when none
+    bool threadEnded_ = false;            // fileUpload returned
     boost::condition_variable progress_;  // notified (all) at each of those changes
 };
 

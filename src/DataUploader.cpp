@@ -8,9 +8,11 @@ constexpr const char* kFile = "src/DataUploader";
 constexpr const char* kUpload = "Orvane::DataUploader::Upload";
 }  // namespace
 
-DataUploader::DataUploader(std::shared_ptr<IFileTransfer> transfer) : transfer_(std::move(transfer)) {}
+DataUploader::DataUploader(std::shared_ptr<IFileTransfer> transfer)
+    : transfer_(std::move(transfer)) {}
 
-FileTransferResult DataUploader::Upload(const FileTransferRequest& request, FileTransferInfo* info) {
+FileTransferResult DataUploader::Upload(const FileTransferRequest& request,
+                                        FileTransferInfo* info) {
     Logger::Put(13, kFile, kUpload, __LINE__, "Upload enter.");
     if (!transfer_) {
         Logger::Put(4, kFile, kUpload, __LINE__, "create interface failed");

@@ -12,13 +12,13 @@
 namespace Orvane {
 
 class DataUploader : public IDataUploader {
-public:
+  public:
     // `transfer` may be empty (CreateInterface failed): every Upload then gives OtherError.
     explicit DataUploader(std::shared_ptr<IFileTransfer> transfer);
     FileTransferResult Upload(const FileTransferRequest& request, FileTransferInfo* info) override;
     void Cancel() override;
 
-private:
+  private:
     const std::shared_ptr<IFileTransfer> transfer_;
 };
 

@@ -30,7 +30,9 @@ void FileBuffer::Push(const VqStreamFileData& record) {
     }
 }
 
-uint64_t FileBuffer::FilesPushed() { return filesPushed_.load(); }
+uint64_t FileBuffer::FilesPushed() {
+    return filesPushed_.load();
+}
 
 VqStreamFileData FileBuffer::Pop() {
     VqStreamFileData record = queue_.Pop();

@@ -20,9 +20,13 @@ FileRecorderModule::FileRecorderModule() = default;
 
 FileRecorderModule::~FileRecorderModule() = default;
 
-bool FileRecorderModule::OnInitialize(std::shared_ptr<void>) { return true; }
+bool FileRecorderModule::OnInitialize(std::shared_ptr<void>) {
+    return true;
+}
 
-void FileRecorderModule::OnStop() { Disconnect(); }
+void FileRecorderModule::OnStop() {
+    Disconnect();
+}
 
 void FileRecorderModule::OnStart() {}
 
@@ -80,8 +84,9 @@ void FileRecorderModule::Connect(ProcessControl* processControl, ModuleSettings 
 
     auto timeManager = std::make_shared<TimeManager>();
     // Multiplied as signed 32-bit integers, as the limit always was (wraps, never widens).
-    int32_t fullSize = static_cast<int32_t>(static_cast<uint32_t>(settings_.bufferFullSize) *
-                                            static_cast<uint32_t>(settings_.uploadInterval) * 1000u);
+    int32_t fullSize =
+        static_cast<int32_t>(static_cast<uint32_t>(settings_.bufferFullSize) *
+                             static_cast<uint32_t>(settings_.uploadInterval) * 1000u);
     auto fileBuffer = std::make_shared<FileBuffer>(fullSize);
     auto transfer = transferFactory_ ? transferFactory_() : VqStreamFileTransfer::CreateInterface();
     auto dataUploader = std::make_shared<DataUploader>(std::move(transfer));
@@ -89,8 +94,8 @@ void FileRecorderModule::Connect(ProcessControl* processControl, ModuleSettings 
     auto nalAnalyzer = std::make_shared<NalAnalyzer>(codecType);
     auto streamBuffer =
         std::make_shared<StreamBuffer>(observer, fileBuffer, timeManager, nalAnalyzer, settings_);
-    auto dataController =
-        std::make_shared<DataController>(observer, fileBuffer, timeManager, dataUploader, settings_);
+    auto dataController = std::make_shared<DataController>(observer, fileBuffer, timeManager,
+                                                           dataUploader, settings_);
     std::optional<AwsInfo> pending;
     {
         std::lock_guard<std::mutex> lock(componentsMutex_);

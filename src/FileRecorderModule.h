@@ -34,7 +34,7 @@ namespace Orvane {
 class ProcessControl;
 
 class FileRecorderModule : public Module {
-public:
+  public:
     FileRecorderModule();
     ~FileRecorderModule() override;
 
@@ -54,9 +54,9 @@ public:
 
     // What an end-of-stream drain left undone.
     struct DrainResult {
-        bool complete = true;        // everything held was stored (or given up) in time
-        uint64_t droppedFiles = 0;   // stream files still in the buffer or in hand
-        uint64_t droppedMs = 0;      // their ms of stream
+        bool complete = true;       // everything held was stored (or given up) in time
+        uint64_t droppedFiles = 0;  // stream files still in the buffer or in hand
+        uint64_t droppedMs = 0;     // their ms of stream
     };
     // End of stream (message thread): waits until the workers have handed on every queued
     // sample, has the stream buffer cut everything it holds into stream files, then waits until
@@ -75,7 +75,7 @@ public:
     // a test installs another. Call before Connect.
     void SetTransferFactory(std::function<std::shared_ptr<IFileTransfer>()> factory);
 
-private:
+  private:
     bool IsWaitingForStart();
     void WaitForStart();
     std::shared_ptr<IStreamBuffer> streamBuffer() const;
@@ -87,17 +87,17 @@ private:
     std::shared_ptr<ITimeManager> timeManager_;
     std::shared_ptr<IDataUploader> dataUploader_;
     std::shared_ptr<INalAnalyzer> nalAnalyzer_;
-    bool filing_ = false;         // the start thread opened the gate
-    bool dataReceived_ = false;   // event: a sample found the gate closed
-    bool stopRequested_ = false;  // set by Disconnect
-    boost::mutex mutex_;          // guards the three flags above
+    bool filing_ = false;                  // the start thread opened the gate
+    bool dataReceived_ = false;            // event: a sample found the gate closed
+    bool stopRequested_ = false;           // set by Disconnect
+    boost::mutex mutex_;                   // guards the three flags above
     boost::condition_variable condition_;  // the start thread waits on it
     std::shared_ptr<std::thread> startThread_;
     ModuleSettings settings_;
 
-    mutable std::mutex componentsMutex_;  // guards the component pointers and pendingAwsInfo_
+    mutable std::mutex componentsMutex_;     // guards the component pointers and pendingAwsInfo_
     std::optional<AwsInfo> pendingAwsInfo_;  // credentials that came before Connect
-    bool connected_ = false;  // between Connect and Disconnect (message thread)
+    bool connected_ = false;                 // between Connect and Disconnect (message thread)
     std::function<std::shared_ptr<IFileTransfer>()> transferFactory_;
 };
 

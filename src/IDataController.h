@@ -10,7 +10,7 @@
 namespace Orvane {
 
 class IDataController {
-public:
+  public:
     virtual void Start() = 0;  // once per controller
     // Cancels a running transfer, wakes every wait and joins the upload thread. Safe to call
     // again or before Start.

@@ -6,9 +6,10 @@
 namespace Orvane {
 
 class IDataUploader {
-public:
+  public:
     // Upload thread; blocks for the whole transfer.
-    virtual FileTransferResult Upload(const FileTransferRequest& request, FileTransferInfo* info) = 0;
+    virtual FileTransferResult Upload(const FileTransferRequest& request,
+                                      FileTransferInfo* info) = 0;
     // Any other thread: makes a running Upload return soon.
     virtual void Cancel() = 0;
     virtual ~IDataUploader() = default;

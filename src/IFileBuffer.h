@@ -9,7 +9,7 @@
 namespace Orvane {
 
 class IFileBuffer {
-public:
+  public:
     // Never waits for room and never refuses for being over the limit.
     virtual void Push(const VqStreamFileData& record) = 0;
     // Waits, without a time limit, while the buffer is empty.

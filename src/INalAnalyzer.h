@@ -9,7 +9,7 @@
 namespace Orvane {
 
 class INalAnalyzer {
-public:
+  public:
     virtual ~INalAnalyzer() = default;
     virtual bool IsIDR(const std::shared_ptr<StreamData>& sample) = 0;
 };

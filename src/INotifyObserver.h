@@ -15,7 +15,7 @@
 namespace Orvane {
 
 class INotifyObserver {
-public:
+  public:
     // Stamps the request with the streaming id and sends it to the parent stream.
     virtual VqResult notifyGetAWSTokenRequest(GetAWSSecureTokenRequest& request) = 0;
     virtual VqResult notifyLastSequenceNumNotify(LastSequenceNumNotify& message) = 0;
@@ -30,7 +30,7 @@ public:
     // Sends the entries (one "UploadInfo" entry in practice) to the parent stream.
     virtual void notifyTransmissionStatus(const std::map<std::string, std::string>& entries) = 0;
 
-protected:
+  protected:
     ~INotifyObserver() = default;
 };
 

@@ -13,7 +13,7 @@
 namespace Orvane {
 
 class IStreamBuffer {
-public:
+  public:
     virtual void Start() = 0;
     // Ends and joins the filing thread; safe to call again and from two threads at once.
     virtual void Stop() = 0;

@@ -7,7 +7,7 @@
 namespace Orvane {
 
 class ITimeManager {
-public:
+  public:
     virtual uint32_t GetTime() = 0;  // ms, wraps after 2^32
     virtual ~ITimeManager() = default;
 };

@@ -8,8 +8,8 @@
 namespace Orvane {
 
 struct ModuleSettings {
-    std::string bucketName;    // S3 bucket that receives the stream files
-    std::string streamingId;   // the framework's id of the stream
+    std::string bucketName;       // S3 bucket that receives the stream files
+    std::string streamingId;      // the framework's id of the stream
     int32_t uploadInterval = 0;   // seconds of stream per stream file; wait after a network error
     int32_t authRetryTime = 0;    // ms to wait for credentials after a token request
     int32_t bufferFullSize = 0;   // upload intervals of stream the file buffer may hold

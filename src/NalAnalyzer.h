@@ -11,12 +11,12 @@
 namespace Orvane {
 
 class NalAnalyzer : public INalAnalyzer {
-public:
+  public:
     explicit NalAnalyzer(const int& codecType);
     ~NalAnalyzer() override;
     bool IsIDR(const std::shared_ptr<StreamData>& sample) override;
 
-private:
+  private:
     std::shared_ptr<nal_access::StreamAnalyzer> analyzer_;
     std::function<bool(const std::shared_ptr<StreamData>&)> isIdr_;  // the chosen test
 };

@@ -55,7 +55,8 @@ bool ProcessControl::getArgument(ModuleSettings& settings) {
     if (!GetArgument_int("startignoretime", settings.startIgnoreTime, 0, 10)) {
         settings.startIgnoreTime = 0;
     }
-    Logger::Put(11, nullptr, nullptr, 0, "ST: start ignore time: %d [ms]", settings.startIgnoreTime);
+    Logger::Put(11, nullptr, nullptr, 0, "ST: start ignore time: %d [ms]",
+                settings.startIgnoreTime);
 
     settings.streamingId = GetStreamingId();
     return true;
@@ -222,7 +223,8 @@ void ProcessControl::notifyModuleExecute() {
 }
 
 VqProcessState ProcessControl::GetModuleStatus() {
-    Logger::Put(12, kFile, "Orvane::ProcessControl::GetModuleStatus", __LINE__, "GetModuleStatus enter.");
+    Logger::Put(12, kFile, "Orvane::ProcessControl::GetModuleStatus", __LINE__,
+                "GetModuleStatus enter.");
     return GetProcessStatus();
 }
 

@@ -22,7 +22,7 @@ namespace Orvane {
 class FileRecorderModule;
 
 class ProcessControl : public BaseProcess, public INotifyObserver {
-public:
+  public:
     ProcessControl(int argc, char** argv);
     ~ProcessControl() override;
 
@@ -55,7 +55,7 @@ public:
     const ModuleSettings& Settings() const { return settings_; }
     bool IsRunning() const { return running_.load(); }
 
-private:
+  private:
     bool getArgument(ModuleSettings& settings);
     bool setAuthenticationInfo(const std::map<std::string, std::string>& properties);
 

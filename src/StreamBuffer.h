@@ -160,7 +160,7 @@ class StreamBuffer : public IStreamBuffer {
     boost::condition_variable dataWait_;
     boost::condition_variable tickWait_;
     std::thread filingThread_;
-    std::mutex lifecycleMutex_;  // serialises Start and Stop (and the join)
+    std::mutex lifecycleMutex_;   // serialises Start and Stop (and the join)
     bool filingStarted_ = false;  // guarded by filingMutex_: the thread left its data wait
 };
 

@@ -6,7 +6,7 @@
 namespace Orvane {
 
 class TimeManager : public ITimeManager {
-public:
+  public:
     uint32_t GetTime() override;
 };
 

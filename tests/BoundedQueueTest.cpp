@@ -1,11 +1,10 @@
-#include "modulebase/BoundedQueue.h"
-
 #include <gtest/gtest.h>
 
 #include <atomic>
 #include <memory>
 #include <thread>
 
+#include "modulebase/BoundedQueue.h"
 #include "tests/support/TestSupport.h"
 
 TEST(BoundedQueueOverflow, RefusesTheNewestItemAndKeepsTheOthersInOrder) {

@@ -1,11 +1,10 @@
-#include "src/DataController.h"
-
 #include <gtest/gtest.h>
 
 #include <chrono>
 #include <thread>
 
 #include "platform/logger/LogCapture.h"
+#include "src/DataController.h"
 #include "src/DataUploader.h"
 #include "src/FileBuffer.h"
 #include "src/TimeManager.h"
@@ -28,16 +27,18 @@ VqStreamFileData fileOf(uint32_t duration, uint64_t firstTimestamp = 0) {
     return f;
 }
 
-AwsInfo credentials(const std::string& tag) { return {"AK" + tag, "SK" + tag, "TK" + tag, "eu-west-1"}; }
+AwsInfo credentials(const std::string& tag) {
+    return {"AK" + tag, "SK" + tag, "TK" + tag, "eu-west-1"};
+}
 
 // One controller over a real file buffer, a scripted transfer and a recording observer.
 struct Rig {
     explicit Rig(int bufferFullSize = 100000, ModuleSettings s = settings())
         : transfer(std::make_shared<ScriptedTransfer>()),
           fileBuffer(std::make_shared<FileBuffer>(bufferFullSize)),
-          controller(std::make_shared<DataController>(&observer, fileBuffer,
-                                                      std::make_shared<TimeManager>(),
-                                                      std::make_shared<DataUploader>(transfer), s)) {}
+          controller(std::make_shared<DataController>(
+              &observer, fileBuffer, std::make_shared<TimeManager>(),
+              std::make_shared<DataUploader>(transfer), s)) {}
     ~Rig() { controller->Stop(); }
 
     static ModuleSettings settings() {
@@ -71,9 +72,11 @@ TEST(DataControllerReports, SuccessIsReportedWithItsUploadInfoLine) {
     ASSERT_TRUE(WaitUntil([&] { return rig.observer.UploadInfos().size() >= 4; }));
     auto infos = rig.observer.UploadInfos();
     EXPECT_EQ(infos[2],
-              "FileIndex, 3, ErrorCode, Success, ResponseTime, 850, FileSize, 1048576, BufferCount, 20000");
-    EXPECT_EQ(infos[3],
-              "FileIndex, 4, ErrorCode, Success, ResponseTime, 850, FileSize, 1048576, BufferCount, 0");
+              "FileIndex, 3, ErrorCode, Success, ResponseTime, 850, FileSize, 1048576, "
+              "BufferCount, 20000");
+    EXPECT_EQ(
+        infos[3],
+        "FileIndex, 4, ErrorCode, Success, ResponseTime, 850, FileSize, 1048576, BufferCount, 0");
     auto entries = rig.entries();
     ASSERT_EQ(entries.size(), 4u);
     for (uint32_t i = 0; i < 4; ++i) {
@@ -163,7 +166,7 @@ TEST(DataControllerCredentials, AuthenticationErrorFetchesFreshCredentialsIntoTh
 // A file buffer that runs an action the first time the upload thread asks whether it is full,
 // i.e. right after a wait for credentials has ended and before the next attempt.
 class HookedFileBuffer : public FileBuffer {
-public:
+  public:
     using FileBuffer::FileBuffer;
     std::function<void()> onFirstFullTest;
     bool IsBufferFull() override {
@@ -180,10 +183,9 @@ TEST(DataControllerCredentials, CredentialsAfterAWaitGaveUpDoNotReachTheFileInHa
     RecordingObserver observer;
     auto transfer = std::make_shared<ScriptedTransfer>();
     auto fileBuffer = std::make_shared<HookedFileBuffer>(100000);
-    auto controller = std::make_shared<DataController>(&observer, fileBuffer,
-                                                       std::make_shared<TimeManager>(),
-                                                       std::make_shared<DataUploader>(transfer),
-                                                       Rig::settings());
+    auto controller =
+        std::make_shared<DataController>(&observer, fileBuffer, std::make_shared<TimeManager>(),
+                                         std::make_shared<DataUploader>(transfer), Rig::settings());
     // No credentials: the first attempt is an authentication error without a transfer; the
     // credentials arrive after that wait gave up, so the next attempt keeps the empty ones.
     fileBuffer->onFirstFullTest = [&] { controller->SetAwsInfo(credentials("late")); };
@@ -245,8 +247,10 @@ TEST(DataControllerRetries, ErrorResultsAreRetriedAtOnceUntilTheyChange) {
 
 TEST(DataControllerGivingUp, EachResultGivesUpWithItsNameAndWarningCode) {
     const std::pair<FileTransferResult, std::pair<const char*, unsigned>> cases[] = {
-        {TimeOut, {"TimeOut", 22}},           {FilePathError, {"FilePathError", 24}},
-        {FileBroken, {"FileBroken", 25}},     {NetworkError, {"NetworkError", 26}},
+        {TimeOut, {"TimeOut", 22}},
+        {FilePathError, {"FilePathError", 24}},
+        {FileBroken, {"FileBroken", 25}},
+        {NetworkError, {"NetworkError", 26}},
         {RequestTimeTooSkewed, {"RequestTimeTooSkewed", 27}},
         {InternalError, {"InternalError", 28}},
         {static_cast<FileTransferResult>(0x80000099), {"Unknown", 0}},
@@ -263,15 +267,17 @@ TEST(DataControllerGivingUp, EachResultGivesUpWithItsNameAndWarningCode) {
         auto entries = rig.entries();
         EXPECT_EQ(entries[0].errorName, expected.first);
         EXPECT_FALSE(entries[0].succeeded);
-        EXPECT_EQ(rig.observer.Warnings(), std::vector<unsigned>{expected.second}) << expected.first;
+        EXPECT_EQ(rig.observer.Warnings(), std::vector<unsigned>{expected.second})
+            << expected.first;
         EXPECT_EQ(rig.observer.UploadInfos()[0].find(std::string("FileIndex, 1, ErrorCode, ") +
                                                      expected.first + ", "),
                   0u);
         // The second file is dropped for the over-full buffer, the third uploaded.
         EXPECT_EQ(entries[1].errorName, "BufferOver");
         EXPECT_EQ(entries[1].duration, 600u);
-        EXPECT_EQ(rig.observer.UploadInfos()[1],
-                  "FileIndex, 2, ErrorCode, OtherError, ResponseTime, 0, FileSize, 0, BufferCount, 600");
+        EXPECT_EQ(
+            rig.observer.UploadInfos()[1],
+            "FileIndex, 2, ErrorCode, OtherError, ResponseTime, 0, FileSize, 0, BufferCount, 600");
         EXPECT_TRUE(entries[2].succeeded);
         for (uint32_t i = 0; i < 3; ++i) EXPECT_EQ(entries[i].sequenceNumber, i + 1);
     }

@@ -1,5 +1,3 @@
-#include "src/FileRecorderModule.h"
-
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -9,6 +7,7 @@
 #include "platform/logger/LogCapture.h"
 #include "platform/logger/Logger.h"
 #include "platform/nal/StreamAnalyzer.h"
+#include "src/FileRecorderModule.h"
 #include "tests/support/ProcessHarness.h"
 #include "tests/support/ScriptedTransfer.h"
 #include "tests/support/TestSupport.h"
@@ -48,7 +47,8 @@ struct Pipeline {
             if (videoMs <= audioMs && videoMs < toMs) {
                 bool idr = frame % framesPerIdr == 0;
                 h.Host().Video(testsupport::MakeReceived(
-                    videoMs, videoMs * 90, idr ? testsupport::H264Idr() : testsupport::H264NonIdr()));
+                    videoMs, videoMs * 90,
+                    idr ? testsupport::H264Idr() : testsupport::H264NonIdr()));
                 ++frame;
             } else {
                 h.Host().Audio(testsupport::MakeReceived(audioMs, audioMs * 48, "aac"));
@@ -249,9 +249,10 @@ TEST(FileRecorderModulePipeline, StreamBecomesNumberedFilesCutBeforeIdrs) {
     for (size_t i = 0; i < 4; ++i) {
         EXPECT_EQ(notifies[i].entries.at(0).sequenceNumber, i + 1);
         EXPECT_TRUE(notifies[i].entries.at(0).succeeded);
-        EXPECT_EQ(infos[i].find("FileIndex, " + std::to_string(i + 1) +
-                                ", ErrorCode, Success, ResponseTime, 12, FileSize, 4096, BufferCount, "),
-                  0u)
+        EXPECT_EQ(
+            infos[i].find("FileIndex, " + std::to_string(i + 1) +
+                          ", ErrorCode, Success, ResponseTime, 12, FileSize, 4096, BufferCount, "),
+            0u)
             << infos[i];
     }
     EXPECT_FALSE(log.Contains("queue overflow (video)"));
@@ -280,8 +281,8 @@ TEST(FileRecorderModuleDrain, EndOfStreamStoresTheTailToTheLastSample) {
     EXPECT_EQ(last.sequenceNumber, 3);
     EXPECT_TRUE(isIdr(last.video.front()));
     EXPECT_EQ(last.video.front().timestamp, 4000u);
-    EXPECT_EQ(last.video.back().timestamp, 4966u);   // the input's last frame
-    EXPECT_EQ(last.audio.back().timestamp, 4980u);   // and its last audio frame
+    EXPECT_EQ(last.video.back().timestamp, 4966u);  // the input's last frame
+    EXPECT_EQ(last.audio.back().timestamp, 4980u);  // and its last audio frame
     uint32_t total = 0;
     for (const auto& r : requests) total += r.duration;
     EXPECT_EQ(total, 4981u);  // to the newest sample, inclusive
@@ -315,7 +316,8 @@ TEST(FileRecorderModuleDrain, AStoreThatIsDownEndsAtTheDeadlineNamingWhatIsDropp
     EXPECT_LT(took, std::chrono::seconds(10));
     bool named = false;
     for (const auto& r : log.Records()) {
-        if (r.message.rfind("drain incomplete after 800 ms: 3 stream files (4981 ms of stream)", 0) == 0) {
+        if (r.message.rfind("drain incomplete after 800 ms: 3 stream files (4981 ms of stream)",
+                            0) == 0) {
             named = true;
             EXPECT_EQ(r.priority, 5);
         }
@@ -368,13 +370,16 @@ TEST(FileRecorderModuleConcurrency, SamplesRaceTheGateAndTheDisconnection) {
         std::atomic<bool> go{true};
         std::thread video([&] {
             for (uint64_t t = 0; go; t += 33)
-                p.h.Host().Video(testsupport::MakeReceived(t, t * 90, t % 990 == 0 ? testsupport::H264Idr() : testsupport::H264NonIdr()));
+                p.h.Host().Video(testsupport::MakeReceived(
+                    t, t * 90, t % 990 == 0 ? testsupport::H264Idr() : testsupport::H264NonIdr()));
         });
         std::thread audio([&] {
-            for (uint64_t t = 0; go; t += 20) p.h.Host().Audio(testsupport::MakeReceived(t, t, "a"));
+            for (uint64_t t = 0; go; t += 20)
+                p.h.Host().Audio(testsupport::MakeReceived(t, t, "a"));
         });
         std::thread meta([&] {
-            for (uint64_t t = 0; go; t += 100) p.h.Host().Meta(testsupport::MakeReceived(t, t, "m"));
+            for (uint64_t t = 0; go; t += 100)
+                p.h.Host().Meta(testsupport::MakeReceived(t, t, "m"));
         });
         std::this_thread::sleep_for(std::chrono::milliseconds(100));
         p.h.Host().Disconnection();

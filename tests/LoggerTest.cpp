@@ -1,11 +1,10 @@
-#include "platform/logger/Logger.h"
-
 #include <gtest/gtest.h>
 #include <unistd.h>
 
 #include <thread>
 
 #include "platform/logger/LogCapture.h"
+#include "platform/logger/Logger.h"
 #include "tests/support/TestSupport.h"
 
 TEST(LoggerFormat, LineCarriesPriorityLocationAndText) {

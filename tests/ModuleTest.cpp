@@ -1,11 +1,10 @@
-#include "modulebase/Module.h"
-
 #include <gtest/gtest.h>
 
 #include <condition_variable>
 #include <mutex>
 #include <vector>
 
+#include "modulebase/Module.h"
 #include "platform/framework/StreamData.h"
 #include "platform/logger/LogCapture.h"
 #include "platform/logger/Logger.h"
@@ -18,7 +17,7 @@ namespace {
 
 // Records what reaches the hooks; the video hook can be held up to let the queue fill.
 class RecordingModule : public Module {
-public:
+  public:
     ~RecordingModule() override { StopThreads(); }
     bool OnInitialize(std::shared_ptr<void>) override { return true; }
     void OnStop() override {}
@@ -200,9 +199,15 @@ TEST(ModuleConcurrency, ProducersAndStopRaceCleanly) {
         module.StartThreads();
         std::atomic<bool> go{true};
         std::vector<std::thread> producers;
-        producers.emplace_back([&] { for (int i = 0; go; ++i) module.PushVideo(MakeSample(i)); });
-        producers.emplace_back([&] { for (int i = 0; go; ++i) module.PushAudio(MakeSample(i)); });
-        producers.emplace_back([&] { for (int i = 0; go; ++i) module.PushMeta(MakeSample(i)); });
+        producers.emplace_back([&] {
+            for (int i = 0; go; ++i) module.PushVideo(MakeSample(i));
+        });
+        producers.emplace_back([&] {
+            for (int i = 0; go; ++i) module.PushAudio(MakeSample(i));
+        });
+        producers.emplace_back([&] {
+            for (int i = 0; go; ++i) module.PushMeta(MakeSample(i));
+        });
         WaitUntil([&] { return module.Count(module.audio) > 50; }, 5000);
         module.StopThreads();
         go = false;

@@ -1,9 +1,8 @@
-#include "src/ProcessControl.h"
-
 #include <gtest/gtest.h>
 
 #include "platform/logger/LogCapture.h"
 #include "src/FileRecorderModule.h"
+#include "src/ProcessControl.h"
 #include "tests/support/ProcessHarness.h"
 #include "tests/support/TestSupport.h"
 
@@ -15,14 +14,17 @@ namespace {
 std::vector<std::string> without(std::vector<std::string> args, const std::string& option) {
     for (size_t i = 0; i + 1 < args.size(); ++i) {
         if (args[i] == option) {
-            args.erase(args.begin() + static_cast<long>(i), args.begin() + static_cast<long>(i) + 2);
+            args.erase(args.begin() + static_cast<long>(i),
+                       args.begin() + static_cast<long>(i) + 2);
             break;
         }
     }
     return args;
 }
 
-std::string recorderBinary() { return testsupport::BuildPath("src/stream-file-recorder"); }
+std::string recorderBinary() {
+    return testsupport::BuildPath("src/stream-file-recorder");
+}
 
 }  // namespace
 
@@ -79,8 +81,8 @@ TEST(ProcessControlOptions, NumbersMustBeWholeAndInRange) {
 
 TEST(ProcessControlOptions, CodecTextContaining264AnywhereIsH264) {
     const std::pair<const char*, uint32_t> cases[] = {
-        {"h264", 0}, {"H264", 0}, {"AVC264", 0}, {"x264-main", 0}, {"h265", 1},
-        {"HEVC", 1}, {"", 1},     {"26 4", 1},
+        {"h264", 0}, {"H264", 0}, {"AVC264", 0}, {"x264-main", 0},
+        {"h265", 1}, {"HEVC", 1}, {"", 1},       {"26 4", 1},
     };
     for (const auto& [text, expected] : cases) {
         auto args = without(RecorderArgs(), "-kct");
@@ -93,8 +95,8 @@ TEST(ProcessControlOptions, CodecTextContaining264AnywhereIsH264) {
 
 TEST(ProcessControlOptions, S3AccelIsCaseInsensitiveEqualityWithTrue) {
     const std::pair<const char*, bool> cases[] = {
-        {"TrUe", true}, {"TRUE", true}, {"true", true}, {"yes", false}, {"1", false},
-        {"true ", false}, {"", false},
+        {"TrUe", true}, {"TRUE", true},   {"true", true}, {"yes", false},
+        {"1", false},   {"true ", false}, {"", false},
     };
     for (const auto& [text, expected] : cases) {
         ProcessHarness h(RecorderArgs({"-s3accel", text}));
@@ -216,7 +218,8 @@ TEST(ProcessControlNotifications, TransmissionStatusAndSequenceNotifyReachThePar
     observer.notifyTransmissionStatus({{"UploadInfo", "BufferOver"}});
     auto statuses = h.Host().TransmissionStatuses();
     ASSERT_EQ(statuses.size(), 1u);
-    EXPECT_EQ(statuses[0].statusMap, (std::map<std::string, std::string>{{"UploadInfo", "BufferOver"}}));
+    EXPECT_EQ(statuses[0].statusMap,
+              (std::map<std::string, std::string>{{"UploadInfo", "BufferOver"}}));
     EXPECT_EQ(log.Find("notifyTransmissionStatus enter.")[0].priority, 13);
 
     LastSequenceNumNotify message;
@@ -254,9 +257,12 @@ TEST(ProcessEntry, MissingCodecFailsAndNoInputFailsWithAReason) {
 
 TEST(ProcessEntry, HugeAndOddOptionValuesNeverCrash) {
     std::string huge(100000, '9');
-    for (const auto& extra : std::vector<std::vector<std::string>>{
-             {"-uploadinterval", huge}, {"-bucketname", huge}, {"-kct", huge}, {"-loglevel", "x"},
-             {"-readrate", "-3"}, {"-uploadinterval"}}) {
+    for (const auto& extra : std::vector<std::vector<std::string>>{{"-uploadinterval", huge},
+                                                                   {"-bucketname", huge},
+                                                                   {"-kct", huge},
+                                                                   {"-loglevel", "x"},
+                                                                   {"-readrate", "-3"},
+                                                                   {"-uploadinterval"}}) {
         auto args = RecorderArgs(extra);
         args.insert(args.begin(), recorderBinary());
         auto r = testsupport::RunProcess(args);

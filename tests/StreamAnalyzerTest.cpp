@@ -42,12 +42,13 @@ std::vector<std::string> h264Units() {
 }
 
 std::vector<std::string> h265Units(bool openGop) {
-    std::string params = std::string("keyint=5:min-keyint=5:scenecut=0:bframes=0:log-level=error:") +
-                         (openGop ? "open-gop=1" : "open-gop=0");
-    return accessUnits(testsupport::MediaClip(
-        openGop ? "analyzer-cra.hevc" : "analyzer-idr.hevc",
-        {"-f", "lavfi", "-i", "testsrc2=size=128x96:rate=10:duration=1", "-c:v", "libx265",
-         "-x265-params", params, "-f", "hevc"}));
+    std::string params =
+        std::string("keyint=5:min-keyint=5:scenecut=0:bframes=0:log-level=error:") +
+        (openGop ? "open-gop=1" : "open-gop=0");
+    return accessUnits(
+        testsupport::MediaClip(openGop ? "analyzer-cra.hevc" : "analyzer-idr.hevc",
+                               {"-f", "lavfi", "-i", "testsrc2=size=128x96:rate=10:duration=1",
+                                "-c:v", "libx265", "-x265-params", params, "-f", "hevc"}));
 }
 
 bool h264(const std::string& au) {
@@ -124,7 +125,7 @@ TEST(StreamAnalyzerH265, IdrIsRecognisedAndCraIsNot) {
 
     auto cra = h265Units(true);
     ASSERT_EQ(cra.size(), 10u);
-    EXPECT_TRUE(h265(cra[0]));  // the stream opens with an IDR
+    EXPECT_TRUE(h265(cra[0]));   // the stream opens with an IDR
     EXPECT_FALSE(h265(cra[5]));  // a later key frame is a CRA picture
     EXPECT_EQ(h265(lengthPrefixed(nalUnits(idr[0]))), true);
     EXPECT_EQ(h265(withStartCodes(nalUnits(idr[0]), 3)), true);

@@ -1,8 +1,7 @@
-#include "platform/framework/StreamData.h"
-
 #include <gtest/gtest.h>
 
 #include "platform/framework/ReceivedSample.h"
+#include "platform/framework/StreamData.h"
 #include "tests/support/TestSupport.h"
 
 TEST(StreamDataFromSample, ReadsEveryFieldAtItsBytePosition) {
@@ -59,8 +58,9 @@ TEST(StreamDataLifetime, ACopyKeepsThePayloadAliveAndSharesItsBytes) {
     queued.reset();
     ASSERT_FALSE(watch.expired());
     EXPECT_EQ(inFile.PayloadData(), bytes);
-    EXPECT_EQ(std::string(reinterpret_cast<const char*>(inFile.PayloadData()), inFile.PayloadBytes()),
-              "payload");
+    EXPECT_EQ(
+        std::string(reinterpret_cast<const char*>(inFile.PayloadData()), inFile.PayloadBytes()),
+        "payload");
     inFile = StreamData();
     EXPECT_TRUE(watch.expired());
 }

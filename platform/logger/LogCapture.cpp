@@ -3,9 +3,13 @@
 void registerCapture(LogCapture* capture);
 void unregisterCapture(LogCapture* capture);
 
-LogCapture::LogCapture() { registerCapture(this); }
+LogCapture::LogCapture() {
+    registerCapture(this);
+}
 
-LogCapture::~LogCapture() { unregisterCapture(this); }
+LogCapture::~LogCapture() {
+    unregisterCapture(this);
+}
 
 void LogCapture::Add(const LogRecord& record) {
     std::lock_guard<std::mutex> lock(mutex_);
@@ -25,7 +29,9 @@ std::vector<LogRecord> LogCapture::Find(const std::string& message) const {
     return found;
 }
 
-size_t LogCapture::Count(const std::string& message) const { return Find(message).size(); }
+size_t LogCapture::Count(const std::string& message) const {
+    return Find(message).size();
+}
 
 std::vector<std::string> LogCapture::Messages() const {
     std::vector<std::string> messages;

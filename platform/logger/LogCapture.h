@@ -16,11 +16,11 @@ struct LogRecord {
     std::string file;      // empty when Put was given null
     std::string function;  // empty when Put was given null
     int line = 0;
-    std::string message;   // the formatted text, without prefix
+    std::string message;  // the formatted text, without prefix
 };
 
 class LogCapture {
-public:
+  public:
     LogCapture();
     ~LogCapture();
     LogCapture(const LogCapture&) = delete;
@@ -38,7 +38,7 @@ public:
     // Internal: called by Logger for every line.
     void Add(const LogRecord& record);
 
-private:
+  private:
     mutable std::mutex mutex_;
     std::vector<LogRecord> records_;
 };

@@ -46,9 +46,13 @@ void Logger::SetLevel(int level) {
     g_level = g_captures.empty() ? level : 1000;
 }
 
-int Logger::GetLevel() { return g_userLevel.load(); }
+int Logger::GetLevel() {
+    return g_userLevel.load();
+}
 
-bool Logger::Enabled(int priority) { return priority <= g_level.load(std::memory_order_relaxed); }
+bool Logger::Enabled(int priority) {
+    return priority <= g_level.load(std::memory_order_relaxed);
+}
 
 bool Logger::SetFile(const std::string& path) {
     try {
@@ -61,8 +65,8 @@ bool Logger::SetFile(const std::string& path) {
     }
 }
 
-void Logger::Put(int priority, const char* file, const char* function, int line,
-                 const char* format, ...) {
+void Logger::Put(int priority, const char* file, const char* function, int line, const char* format,
+                 ...) {
     if (!Enabled(priority)) return;
 
     char stackBuffer[1024];

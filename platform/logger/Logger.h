@@ -1,7 +1,8 @@
 // Logger: the one log channel of every component.
 //
 // Put() formats printf-style and writes one line:
-//   2026-12-06 11:00:10.012 [tid] <11> src/StreamBuffer:123 Orvane::StreamBuffer::Start: Start enter.
+//   2026-12-06 11:00:10.012 [tid] <11> src/StreamBuffer:123 Orvane::StreamBuffer::Start: Start
+//   enter.
 // File, function and line are left out when null/0. Lines whose priority number is above the
 // level are dropped before any formatting, so trace lines cost one atomic load when off.
 // Thread-safe: any thread may call any member at any time.
@@ -10,7 +11,7 @@
 #include <string>
 
 class Logger {
-public:
+  public:
     // Default level: lines with a priority number above it are not written.
     static constexpr int kDefaultLevel = 11;
 

@@ -50,7 +50,7 @@ Verdict classifyH264(const uint8_t* nal, size_t left) {
     unsigned type = nal[0] & 0x1F;
     if (type == 5) return Verdict::Idr;
     if (type >= 1 && type <= 4) return Verdict::NotIdr;  // coded slice / data partition
-    return Verdict::KeepLooking;                        // SPS, PPS, SEI, AUD, ...
+    return Verdict::KeepLooking;                         // SPS, PPS, SEI, AUD, ...
 }
 
 Verdict classifyH265(const uint8_t* nal, size_t left) {

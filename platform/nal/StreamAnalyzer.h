@@ -17,7 +17,7 @@ class StreamData;
 namespace nal_access {
 
 class StreamAnalyzer {
-public:
+  public:
     StreamAnalyzer() = default;
     virtual ~StreamAnalyzer() = default;
 

@@ -35,8 +35,8 @@ struct FileTransferRequest {
     std::string secretKey;
     std::string region;
     std::string sessionToken;
-    bool s3Accel = false;   // use S3 transfer acceleration
-    uint32_t duration = 0;  // milliseconds of stream in the file
+    bool s3Accel = false;           // use S3 transfer acceleration
+    uint32_t duration = 0;          // milliseconds of stream in the file
     std::vector<StreamData> video;  // oldest first
     std::vector<StreamData> audio;
     std::vector<StreamData> meta;
@@ -49,7 +49,7 @@ struct FileTransferInfo {
 };
 
 class IFileTransfer {
-public:
+  public:
     virtual ~IFileTransfer() = default;
     virtual FileTransferResult Transfer(const FileTransferRequest& request,
                                         FileTransferInfo* info) = 0;
@@ -59,7 +59,7 @@ public:
 };
 
 class VqStreamFileTransfer {
-public:
+  public:
     // A transfer object configured from the framework's options (endpoint, format, key
     // prefix); empty when that configuration cannot work (the reason is logged).
     static std::shared_ptr<IFileTransfer> CreateInterface();

@@ -33,7 +33,7 @@ struct StoreCredentials {
 };
 
 class IObjectStore {
-public:
+  public:
     virtual ~IObjectStore() = default;
     // Stores the object; fills info->fileSize and info->responseTime (ms from the start of
     // the request to the end of the response). Returns one of the FileTransferResult values.

@@ -16,7 +16,8 @@ ProcessHarness::ProcessHarness(std::vector<std::string> args) : args_(std::move(
     for (auto& a : args_) argv_.push_back(a.data());
     argv_.push_back(nullptr);
     host_ = std::make_shared<TestHost>();
-    process_ = std::make_unique<Orvane::ProcessControl>(static_cast<int>(args_.size()), argv_.data());
+    process_ =
+        std::make_unique<Orvane::ProcessControl>(static_cast<int>(args_.size()), argv_.data());
     process_->SetHost(host_);
 }
 

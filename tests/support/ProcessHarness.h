@@ -14,7 +14,7 @@ namespace testsupport {
 std::vector<std::string> RecorderArgs(std::vector<std::string> extra = {});
 
 class ProcessHarness {
-public:
+  public:
     explicit ProcessHarness(std::vector<std::string> args);
     ~ProcessHarness();
 
@@ -22,7 +22,7 @@ public:
     TestHost& Host() { return *host_; }
     bool Initialize() { return process_->Initialize(); }
 
-private:
+  private:
     std::vector<std::string> args_;
     std::vector<char*> argv_;
     std::shared_ptr<TestHost> host_;

@@ -45,7 +45,8 @@ VqProcessState RecordingObserver::GetModuleStatus() {
     return state_;
 }
 
-void RecordingObserver::notifyTransmissionStatus(const std::map<std::string, std::string>& entries) {
+void RecordingObserver::notifyTransmissionStatus(
+    const std::map<std::string, std::string>& entries) {
     std::lock_guard<std::mutex> lock(mutex_);
     auto it = entries.find("UploadInfo");
     if (it != entries.end()) uploadInfos_.push_back(it->second);

@@ -13,7 +13,7 @@
 namespace testsupport {
 
 class RecordingObserver : public Orvane::INotifyObserver {
-public:
+  public:
     VqResult notifyGetAWSTokenRequest(GetAWSSecureTokenRequest& request) override;
     VqResult notifyLastSequenceNumNotify(LastSequenceNumNotify& message) override;
     void notifyModuleError(unsigned int code) override;
@@ -35,7 +35,7 @@ public:
     unsigned Code() const;
     void SetState(VqProcessState state, unsigned code);
 
-private:
+  private:
     mutable std::mutex mutex_;
     std::function<void()> tokenAction_;
     size_t tokenRequests_ = 0;

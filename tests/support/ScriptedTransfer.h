@@ -17,7 +17,7 @@
 namespace testsupport {
 
 class ScriptedTransfer : public IFileTransfer {
-public:
+  public:
     explicit ScriptedTransfer(FileTransferResult fallback = Success) : fallback_(fallback) {}
 
     void Script(std::vector<FileTransferResult> results);
@@ -31,7 +31,8 @@ public:
     // that completes although a stop came meanwhile). Default true.
     void SetCancelAborts(bool aborts);
 
-    FileTransferResult Transfer(const FileTransferRequest& request, FileTransferInfo* info) override;
+    FileTransferResult Transfer(const FileTransferRequest& request,
+                                FileTransferInfo* info) override;
     void Cancel() override;
 
     std::vector<FileTransferRequest> Requests() const;
@@ -39,7 +40,7 @@ public:
     bool Cancelled() const;
     bool InTransfer() const;  // a transfer is blocked in Hold now
 
-private:
+  private:
     mutable std::mutex mutex_;
     std::condition_variable changed_;
     std::deque<FileTransferResult> script_;

@@ -36,7 +36,9 @@ std::string H264Idr(size_t bytes) {
     return pad(au, bytes);
 }
 
-std::string H264NonIdr(size_t bytes) { return pad(kStart + std::string("\x41\x9a\x02", 3), bytes); }
+std::string H264NonIdr(size_t bytes) {
+    return pad(kStart + std::string("\x41\x9a\x02", 3), bytes);
+}
 
 std::string H265Idr(size_t bytes) {
     std::string au = kStart + std::string("\x40\x01\x0c\x01", 4) + kStart +
@@ -45,7 +47,9 @@ std::string H265Idr(size_t bytes) {
     return pad(au, bytes);
 }
 
-std::string H265NonIdr(size_t bytes) { return pad(kStart + std::string("\x02\x01\xd0", 3), bytes); }
+std::string H265NonIdr(size_t bytes) {
+    return pad(kStart + std::string("\x02\x01\xd0", 3), bytes);
+}
 
 std::shared_ptr<ReceivedSample> MakeReceived(uint64_t timestamp, uint64_t rtpTime,
                                              std::string payload) {
@@ -113,7 +117,7 @@ std::string MediaClip(const std::string& fileName, const std::vector<std::string
     std::string dir = BuildPath("media");
     mkdir(dir.c_str(), 0755);
     std::string path = dir + "/" + fileName;
-    struct stat st{};
+    struct stat st {};
     if (stat(path.c_str(), &st) == 0 && st.st_size > 0) return path;
     // Write under a temporary name and rename, so parallel tests never read half a clip.
     std::string tmp = path + ".tmp" + std::to_string(getpid()) + std::string(".") +

@@ -31,9 +31,9 @@ std::shared_ptr<StreamData> MakeSample(uint64_t timestamp, uint64_t rtpTime = 0,
 std::shared_ptr<StreamData> MakeVideo(uint64_t timestamp, bool idr);
 
 struct ProcessResult {
-    int exitStatus = -1;   // exit code, or -1 when killed by a signal
-    int signal = 0;        // terminating signal, 0 if exited
-    std::string output;    // stdout and stderr together
+    int exitStatus = -1;  // exit code, or -1 when killed by a signal
+    int signal = 0;       // terminating signal, 0 if exited
+    std::string output;   // stdout and stderr together
 };
 // Runs argv[0] with the arguments (no shell), waits at most `timeoutMs`.
 ProcessResult RunProcess(const std::vector<std::string>& argv, int timeoutMs = 60000);
