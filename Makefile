@@ -2,7 +2,7 @@
 JOBS ?= $(shell nproc)
 CMAKE_GEN := -G Ninja
 
-.PHONY: deps build test tsan bench format clean
+.PHONY: deps build run test tsan bench format clean
 
 deps:
 	@bash scripts/install-deps.sh
@@ -10,6 +10,10 @@ deps:
 build: deps
 	@cmake -S . -B build $(CMAKE_GEN) -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev/null
 	@cmake --build build -j $(JOBS)
+
+# Records a 60 s demo clip into recordings/demo/ and lists the stored objects.
+run: build
+	@bash scripts/run-demo.sh
 
 # Unit and integration tests under AddressSanitizer and UndefinedBehaviorSanitizer.
 test: deps
@@ -27,6 +31,7 @@ bench: deps
 	@cmake -S . -B build-bench $(CMAKE_GEN) -DCMAKE_BUILD_TYPE=Release -DSFR_BENCH=ON >/dev/null
 	@cmake --build build-bench -j $(JOBS)
 	@for b in build-bench/bench/bench_*; do [ -x "$$b" ] && "$$b"; done
+	@bash bench/compare_segmenter.sh build-bench
 
 format:
 	@git ls-files '*.cpp' '*.h' | xargs clang-format -i

@@ -71,16 +71,17 @@ TEST(SampleClockTest, BackwardJumpOfAllTracksIsOneRebaseAndStaysContinuous) {
     SampleClock clock;
     int64_t src = 100 * kSecond;
     SampleClock::Times last{};
-    for (int i = 0; i < 90; ++i) {  // 3 s of a camera
-        place(clock, SampleClock::kVideo, src + i * kFrame, src + i * kFrame, kFrame);
-        last = place(clock, SampleClock::kAudio, src + i * kFrame, src + i * kFrame).times;
+    // 3 s of a camera whose audio is muxed 150 ms ahead of its video.
+    for (int i = 0; i < 90; ++i) {
+        const int64_t t = src + i * kFrame;
+        place(clock, SampleClock::kVideo, t, t, kFrame);
+        last = place(clock, SampleClock::kAudio, t + 150000, t + 150000).times;
     }
-    const int64_t lastVideo = 89 * kFrame;
     // The camera restarts its clock at 0 (reconnect).
     auto v = place(clock, SampleClock::kVideo, 0, kFrame, kFrame);
     auto a = place(clock, SampleClock::kAudio, 5000, 5000);
     ASSERT_TRUE(v.ok && a.ok);
-    EXPECT_EQ(v.times.dtsUs, lastVideo + kFrame);  // one frame after where it was
+    EXPECT_EQ(v.times.dtsUs, last.dtsUs + kFrame);  // one frame after the newest time
     EXPECT_EQ(v.times.ptsUs - v.times.dtsUs, kFrame);
     EXPECT_GE(a.times.dtsUs, last.dtsUs);            // audio follows the same new offset
     EXPECT_EQ(a.times.dtsUs - v.times.dtsUs, 5000);  // and stays in sync with the video

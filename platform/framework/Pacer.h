@@ -3,8 +3,9 @@
 // The receive thread calls Pace with each packet's decode time on the shared clock before it
 // hands the packet over; Pace blocks (a timed wait, no polling) until the wall clock has caught
 // up with that time divided by the rate. The first packet sets the start. To keep wake-ups few
-// (each costs a futex round trip), a packet that is due within kSlack goes at once: the input
-// runs at most kSlack ahead of its schedule.
+// (each costs a futex round trip), a packet that is due soon goes at once: the input runs
+// ahead of its schedule by at most kSlack of wall-clock time and at most kMediaSlack of media
+// time (at high rates the latter bounds the bursts that the module's queues must absorb).
 //
 // Threads: one thread (the receive thread) calls Pace; the StopSignal may be raised from any
 // thread and ends a wait at once.
@@ -18,9 +19,10 @@
 class Pacer {
   public:
     static constexpr std::chrono::milliseconds kSlack{20};
+    static constexpr std::chrono::milliseconds kMediaSlack{50};
 
     // `rate` <= 0: no pacing (Pace returns at once unless stopped).
-    Pacer(double rate, StopSignal& stop) : rate_(rate), stop_(stop) {}
+    Pacer(double rate, StopSignal& stop);
 
     // Waits until the packet with decode time `dtsUs` (µs, shared clock) is due. False when
     // the stop signal was raised.
@@ -29,6 +31,7 @@ class Pacer {
   private:
     double rate_;
     StopSignal& stop_;
+    std::chrono::steady_clock::duration slack_;  // the smaller of the two slacks, wall clock
     bool started_ = false;
     int64_t firstUs_ = 0;  // decode time of the first packet
     std::chrono::steady_clock::time_point wallStart_;

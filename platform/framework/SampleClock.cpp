@@ -66,8 +66,11 @@ bool SampleClock::Place(Track track, bool hasPts, int64_t ptsUs, bool hasDts, in
             offset = epochOffsetUs_;
         } else {
             const int64_t step = state.stepUs > 0 ? state.stepUs : kDefaultStepUs;
+            // One step after the newest time of any track, so that the tracks that follow
+            // this jump with the same offset land after their own last packets too and stay
+            // in sync with this one.
             const int64_t target =
-                state.started ? std::max(state.lastDtsUs + step, newestUs_) : newestUs_;
+                state.started ? std::max(state.lastDtsUs, newestUs_) + step : newestUs_;
             const int64_t jump = dtsUs + offset - target;
             offset = target - dtsUs;
             epochOffsetUs_ = offset;

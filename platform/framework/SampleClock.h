@@ -9,9 +9,9 @@
 //   - within a track, the decode time never decreases;
 //   - a jump of the source's clock backwards (any amount) or forwards by more than
 //     kMaxForwardJumpUs beyond the newest time of any track is re-based: the track goes on
-//     one packet step after where it was, with one log line per jump. The other tracks take
-//     the same new offset when it fits them (one jump of the source is one log line, not one
-//     per track), else they re-base on their own.
+//     one packet step after the newest time of any track, with one log line per jump. The other
+//     tracks take the same new offset when it fits them (one jump of the source is one log line,
+//     not one per track), else they re-base on their own.
 // Presentation times move with their decode times, so B-frame reordering is kept.
 //
 // The clock lives as long as the host's input, across reopenings of a live input, so that a

@@ -1,0 +1,515 @@
+// The real stream-file-recorder binary on real media: what it stores must decode to exactly the
+// input's frames; credentials from a credential process against s3rver; a live UDP input that
+// stops and starts again; SIGINT; inputs it cannot record; sources with broken clocks.
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <netinet/in.h>
+#include <signal.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+#include <regex>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "tests/support/S3rver.h"
+#include "tests/support/TestSupport.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+using testsupport::BuildPath;
+using testsupport::MediaClip;
+using testsupport::ReadFile;
+using testsupport::RunProcess;
+
+std::string Recorder() {
+    return BuildPath("src/stream-file-recorder");
+}
+
+// A fresh directory per test under the build tree.
+std::string Scratch(const std::string& name) {
+    std::string dir = BuildPath("e2e/" + name + "-" + std::to_string(getpid()));
+    fs::remove_all(dir);
+    fs::create_directories(dir);
+    return dir;
+}
+
+std::vector<std::string> RecorderArgs(const std::string& input, const std::string& dir,
+                                      std::vector<std::string> extra) {
+    std::vector<std::string> args = {Recorder(),
+                                     "-input",
+                                     input,
+                                     "-uploadinterval",
+                                     "1",
+                                     "-bufferfullsize",
+                                     "100",
+                                     "-authretrytime",
+                                     "3000",
+                                     "-kct",
+                                     "h264",
+                                     "-bucketname",
+                                     "rec",
+                                     "-status",
+                                     dir + "/status.jsonl",
+                                     "-logfile",
+                                     dir + "/log.txt"};
+    args.insert(args.end(), extra.begin(), extra.end());
+    return args;
+}
+
+// A child process that runs while the test goes on.
+class Child {
+  public:
+    explicit Child(const std::vector<std::string>& argv, const std::string& output = "/dev/null") {
+        pid_ = fork();
+        if (pid_ == 0) {
+            int fd = open(output.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+            if (fd >= 0) {
+                dup2(fd, 1);
+                dup2(fd, 2);
+            }
+            std::vector<char*> args;
+            for (const auto& a : argv) args.push_back(const_cast<char*>(a.c_str()));
+            args.push_back(nullptr);
+            execvp(args[0], args.data());
+            _exit(127);
+        }
+    }
+    ~Child() {
+        if (pid_ > 0 && !done_) {
+            kill(pid_, SIGKILL);
+            waitpid(pid_, nullptr, 0);
+        }
+    }
+    void Signal(int signo) { kill(pid_, signo); }
+    // Exit status, or -1 when killed by a signal or still running after `timeoutMs`.
+    int Wait(int timeoutMs) {
+        if (!done_) {
+            int status = 0;
+            done_ = testsupport::WaitUntil([&] { return waitpid(pid_, &status, WNOHANG) == pid_; },
+                                           timeoutMs);
+            if (done_ && WIFEXITED(status)) status_ = WEXITSTATUS(status);
+        }
+        return status_;
+    }
+
+  private:
+    pid_t pid_ = -1;
+    bool done_ = false;
+    int status_ = -1;
+};
+
+// The stored objects in the order of their sequence numbers.
+std::vector<std::string> Objects(const std::string& dir) {
+    std::vector<std::pair<long, std::string>> found;
+    if (!fs::exists(dir)) return {};
+    std::regex name(".*_([0-9]+)\\.ts$");
+    for (const auto& entry : fs::recursive_directory_iterator(dir)) {
+        std::smatch m;
+        std::string path = entry.path().string();
+        if (entry.is_regular_file() && std::regex_match(path, m, name))
+            found.emplace_back(std::stol(m[1]), path);
+    }
+    std::sort(found.begin(), found.end());
+    std::vector<std::string> paths;
+    for (auto& f : found) paths.push_back(f.second);
+    return paths;
+}
+
+std::string Concatenate(const std::vector<std::string>& objects, const std::string& out) {
+    std::ofstream o(out, std::ios::binary);
+    for (const auto& object : objects) o << ReadFile(object);
+    return out;
+}
+
+// The MD5 of every decoded video frame, in output order.
+std::vector<std::string> FrameHashes(const std::string& path) {
+    auto r = RunProcess({"ffmpeg", "-v", "error", "-i", path, "-map", "0:v", "-fps_mode",
+                         "passthrough", "-f", "framemd5", "-"},
+                        120000);
+    std::vector<std::string> hashes;
+    std::istringstream lines(r.output);
+    std::string line;
+    while (std::getline(lines, line)) {
+        if (line.empty() || line[0] == '#') continue;
+        hashes.push_back(line.substr(line.find_last_of(", ") + 1));
+    }
+    return hashes;
+}
+
+// The sequence numbers and durations of the LastSequenceNumNotify lines.
+struct Notified {
+    std::vector<long> sequence;
+    std::vector<long> durations;
+    size_t tokenRequests = 0;
+    size_t uploadInfos = 0;
+};
+Notified ReadStatus(const std::string& path) {
+    Notified n;
+    std::istringstream lines(ReadFile(path));
+    std::string line;
+    std::regex seq("\"sequenceNumber\":([0-9]+),\"succeeded\":true.*\"duration\":([0-9]+)");
+    while (std::getline(lines, line)) {
+        std::smatch m;
+        if (line.find("\"LastSequenceNumNotify\"") != std::string::npos &&
+            std::regex_search(line, m, seq)) {
+            n.sequence.push_back(std::stol(m[1]));
+            n.durations.push_back(std::stol(m[2]));
+        }
+        n.tokenRequests += line.find("\"GetAWSSecureTokenRequest\"") != std::string::npos;
+        n.uploadInfos += line.find("\"UploadInfo\"") != std::string::npos;
+    }
+    return n;
+}
+
+double Duration(const std::string& path) {
+    auto r = RunProcess(
+        {"ffprobe", "-v", "error", "-show_entries", "format=duration", "-of", "csv=p=0", path});
+    return std::atof(r.output.c_str());
+}
+
+// Records `clip` into a local directory and checks the objects against the input's frames.
+// `interval` must be longer than the clip's longest GOP, so that every object begins with an
+// IDR and decodes on its own (a longer GOP is split, and the object holding its rest does not).
+void ExpectFramesOfTheInput(const std::string& clip, const std::string& codec, int gop,
+                            const std::string& interval = "1") {
+    ASSERT_FALSE(clip.empty());
+    const std::string dir = Scratch("frames-" + codec + "-" + std::to_string(gop));
+    fs::create_directories(dir + "/store/rec");
+    auto r = RunProcess(RecorderArgs(clip, dir,
+                                     {"-kct", codec, "-readrate", "10", "-uploadinterval", interval,
+                                      "-endpoint", "file://" + dir + "/store"}),
+                        120000);
+    const std::string log = ReadFile(dir + "/log.txt");
+    ASSERT_EQ(r.exitStatus, 0) << r.output << log;
+    EXPECT_EQ(log.find("queue overflow"), std::string::npos);
+    auto objects = Objects(dir + "/store/rec");
+    ASSERT_GE(objects.size(), 2u) << log;
+
+    Notified status = ReadStatus(dir + "/status.jsonl");
+    ASSERT_EQ(status.sequence.size(), objects.size());
+    for (size_t i = 0; i < status.sequence.size(); ++i) {
+        EXPECT_EQ(status.sequence[i], static_cast<long>(i + 1));
+    }
+    EXPECT_EQ(status.uploadInfos, objects.size());
+
+    const auto input = FrameHashes(clip);
+    const auto stored = FrameHashes(Concatenate(objects, dir + "/all.ts"));
+    ASSERT_FALSE(stored.empty());
+    auto first = std::find(input.begin(), input.end(), stored.front());
+    ASSERT_NE(first, input.end());
+    const size_t k = static_cast<size_t>(first - input.begin());
+    if (gop > 0) {
+        EXPECT_EQ(k % gop, 0u) << "the first stored frame is not an IDR";
+    }
+    ASSERT_LE(k + stored.size(), input.size());
+    EXPECT_TRUE(std::equal(stored.begin(), stored.end(), input.begin() + k))
+        << "stored frames are not a contiguous run of the input's";
+    // The end of the file is drained: the last object ends with the input's last frame.
+    EXPECT_EQ(k + stored.size(), input.size());
+    for (const auto& object : objects) {
+        auto decode = RunProcess({"ffmpeg", "-v", "error", "-i", object, "-f", "null", "-"});
+        EXPECT_TRUE(decode.output.empty()) << object << ": " << decode.output;
+    }
+}
+
+TEST(EndToEndTest, StoredObjectsDecodeToTheInputsFramesH264) {
+    ExpectFramesOfTheInput(
+        MediaClip("e2e_h264.mp4", {"-f",
+                                   "lavfi",
+                                   "-i",
+                                   "testsrc2=size=320x240:rate=30:duration=5",
+                                   "-f",
+                                   "lavfi",
+                                   "-i",
+                                   "sine=frequency=440:sample_rate=48000:duration=5",
+                                   "-c:v",
+                                   "libx264",
+                                   "-preset",
+                                   "ultrafast",
+                                   "-pix_fmt",
+                                   "yuv420p",
+                                   "-g",
+                                   "30",
+                                   "-keyint_min",
+                                   "30",
+                                   "-sc_threshold",
+                                   "0",
+                                   "-bf",
+                                   "0",
+                                   "-c:a",
+                                   "aac",
+                                   "-b:a",
+                                   "64k"}),
+        "h264", 30);
+}
+
+TEST(EndToEndTest, StoredObjectsDecodeToTheInputsFramesH264WithBFrames) {
+    ExpectFramesOfTheInput(
+        MediaClip("e2e_h264_bframes.ts",
+                  {"-f",
+                   "lavfi",
+                   "-i",
+                   "testsrc2=size=320x240:rate=30:duration=6,negate=enable='lt(mod(t,3.7),1.3)'",
+                   "-f",
+                   "lavfi",
+                   "-i",
+                   "sine=frequency=440:sample_rate=48000:duration=6",
+                   "-c:v",
+                   "libx264",
+                   "-preset",
+                   "veryfast",
+                   "-pix_fmt",
+                   "yuv420p",
+                   "-g",
+                   "90",
+                   "-keyint_min",
+                   "15",
+                   "-sc_threshold",
+                   "40",
+                   "-bf",
+                   "3",
+                   "-c:a",
+                   "aac",
+                   "-b:a",
+                   "64k"}),
+        "h264", 0, "4");
+}
+
+TEST(EndToEndTest, StoredObjectsDecodeToTheInputsFramesH265) {
+    ExpectFramesOfTheInput(
+        MediaClip("e2e_h265.mp4",
+                  {"-f",
+                   "lavfi",
+                   "-i",
+                   "testsrc2=size=320x240:rate=30:duration=5",
+                   "-f",
+                   "lavfi",
+                   "-i",
+                   "sine=frequency=440:sample_rate=48000:duration=5",
+                   "-c:v",
+                   "libx265",
+                   "-preset",
+                   "ultrafast",
+                   "-x265-params",
+                   "keyint=30:min-keyint=30:scenecut=0:open-gop=0:bframes=0:log-level=error",
+                   "-pix_fmt",
+                   "yuv420p",
+                   "-c:a",
+                   "aac",
+                   "-b:a",
+                   "64k"}),
+        "h265", 30);
+}
+
+std::string ShortClip() {
+    return MediaClip("e2e_short.ts", {"-f",
+                                      "lavfi",
+                                      "-i",
+                                      "testsrc2=size=320x240:rate=30:duration=4",
+                                      "-f",
+                                      "lavfi",
+                                      "-i",
+                                      "sine=frequency=440:sample_rate=48000:duration=4",
+                                      "-c:v",
+                                      "libx264",
+                                      "-preset",
+                                      "ultrafast",
+                                      "-pix_fmt",
+                                      "yuv420p",
+                                      "-g",
+                                      "30",
+                                      "-keyint_min",
+                                      "30",
+                                      "-sc_threshold",
+                                      "0",
+                                      "-bf",
+                                      "0",
+                                      "-c:a",
+                                      "aac",
+                                      "-b:a",
+                                      "64k"});
+}
+
+TEST(EndToEndTest, ToS3rverWithCredentialsFromACredentialProcess) {
+    testsupport::S3rver server;
+    ASSERT_TRUE(server.Start(std::string(SFR_SOURCE_DIR) + "/scripts/s3rver.sh", BuildPath("node")))
+        << server.Error();
+    const std::string dir = Scratch("s3");
+    // The first answer carries a wrong secret; every later one the right key pair.
+    const std::string script = dir + "/credentials.sh";
+    std::ofstream(script) << "#!/bin/sh\n"
+                          << "count=" << dir << "/count\n"
+                          << "echo x >> \"$count\"\n"
+                          << "secret=" << testsupport::S3rver::kSecretKey << "\n"
+                          << "[ \"$(wc -l < \"$count\")\" -eq 1 ] && secret=wrong-secret\n"
+                          << "printf '{\"Version\":1,\"AccessKeyId\":\"%s\",\"SecretAccessKey\":"
+                             "\"%s\",\"SessionToken\":\"token\"}' "
+                          << testsupport::S3rver::kAccessKey << " \"$secret\"\n";
+    chmod(script.c_str(), 0755);
+    auto r = RunProcess(RecorderArgs(ShortClip(), dir,
+                                     {"-readrate", "20", "-endpoint", server.Endpoint(),
+                                      "-credentialprocess", script, "-region", "us-east-1"}),
+                        120000);
+    const std::string log = ReadFile(dir + "/log.txt");
+    ASSERT_EQ(r.exitStatus, 0) << r.output << log;
+    EXPECT_EQ(log.find("wrong-secret"), std::string::npos);
+    EXPECT_EQ(log.find(testsupport::S3rver::kSecretKey), std::string::npos);
+
+    Notified status = ReadStatus(dir + "/status.jsonl");
+    ASSERT_GE(status.sequence.size(), 2u) << log;
+    EXPECT_GE(status.tokenRequests, 1u);  // after the wrong key was refused
+    const std::string asked = ReadFile(dir + "/count");
+    EXPECT_GE(std::count(asked.begin(), asked.end(), '\n'), 2);  // asked again after the refusal
+
+    auto listing = RunProcess(
+        {"env", "AWS_ACCESS_KEY_ID=AKIDTEST", "AWS_SECRET_ACCESS_KEY=secretTEST",
+         "AWS_DEFAULT_REGION=us-east-1", "AWS_EC2_METADATA_DISABLED=true",
+         "AWS_CONFIG_FILE=/dev/null", "AWS_SHARED_CREDENTIALS_FILE=/dev/null", "/usr/bin/aws",
+         "--endpoint-url", server.Endpoint(), "s3", "ls", "--recursive", "s3://rec/"},
+        120000);
+    ASSERT_EQ(listing.exitStatus, 0) << listing.output;
+    size_t objects = 0;
+    for (size_t at = 0; (at = listing.output.find(".ts", at)) != std::string::npos; ++at) ++objects;
+    EXPECT_EQ(objects, status.sequence.size()) << listing.output;
+}
+
+int FreeUdpPort() {
+    int fd = socket(AF_INET, SOCK_DGRAM, 0);
+    sockaddr_in address{};
+    address.sin_family = AF_INET;
+    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof address);
+    socklen_t length = sizeof address;
+    getsockname(fd, reinterpret_cast<sockaddr*>(&address), &length);
+    close(fd);
+    return ntohs(address.sin_port);
+}
+
+TEST(EndToEndTest, LiveUdpInputThatStopsAndStartsAgainIsRecordedAcrossTheGap) {
+    const std::string clip = ShortClip();
+    const std::string dir = Scratch("udp");
+    fs::create_directories(dir + "/store/rec");
+    const std::string url = "udp://127.0.0.1:" + std::to_string(FreeUdpPort());
+    const std::vector<std::string> sender = {"ffmpeg",
+                                             "-v",
+                                             "error",
+                                             "-re",
+                                             "-i",
+                                             clip,
+                                             "-c",
+                                             "copy",
+                                             "-f",
+                                             "mpegts",
+                                             url + "?pkt_size=1316"};
+    // Ends by itself 6 s of input in: 4 s of the first sending and 2 s of the second.
+    Child recorder(
+        RecorderArgs(url, dir, {"-duration", "6", "-endpoint", "file://" + dir + "/store"}),
+        dir + "/output.txt");
+    {
+        Child first(sender);
+        EXPECT_EQ(first.Wait(60000), 0);
+    }
+    // After 10 s of silence the recorder gives the input up and reopens it.
+    ASSERT_TRUE(testsupport::WaitUntil(
+        [&] { return ReadFile(dir + "/log.txt").find("reopening in") != std::string::npos; },
+        60000))
+        << ReadFile(dir + "/log.txt");
+    Child second(sender);
+    ASSERT_EQ(recorder.Wait(90000), 0) << ReadFile(dir + "/log.txt");
+    const std::string log = ReadFile(dir + "/log.txt");
+    EXPECT_NE(log.find("reopened"), std::string::npos);
+    EXPECT_NE(log.find("jumped by"), std::string::npos);  // the second sending restarts at 0
+
+    auto objects = Objects(dir + "/store/rec");
+    ASSERT_FALSE(objects.empty()) << log;
+    const std::string all = Concatenate(objects, dir + "/all.ts");
+    auto probe = RunProcess({"ffprobe", "-v", "error", "-select_streams", "v:0", "-show_entries",
+                             "packet=dts_time", "-of", "csv=p=0", all});
+    std::istringstream lines(probe.output);
+    std::vector<double> dts;
+    for (std::string line; std::getline(lines, line);)
+        if (!line.empty()) dts.push_back(std::atof(line.c_str()));
+    ASSERT_GT(dts.size(), 60u);
+    for (size_t i = 1; i < dts.size(); ++i) {
+        EXPECT_GT(dts[i], dts[i - 1]) << i;
+        // At the reconnect the video goes on after the newest audio (muxed up to ~0.7 s
+        // ahead), so that both stay in sync: a short step, never the 10 s of silence.
+        EXPECT_LT(dts[i] - dts[i - 1], 1.0) << "gap at packet " << i;
+    }
+    // Both sendings are in the recording: more than the first one alone could give.
+    EXPECT_GT(dts.back() - dts.front(), 3.5);
+}
+
+TEST(EndToEndTest, SigintEndsARunInOrderWithExitCodeZero) {
+    const std::string dir = Scratch("sigint");
+    fs::create_directories(dir + "/store/rec");
+    Child recorder(RecorderArgs(ShortClip(), dir,
+                                {"-readrate", "0.5", "-endpoint", "file://" + dir + "/store"}),
+                   dir + "/output.txt");
+    ASSERT_TRUE(testsupport::WaitUntil(
+        [&] { return ReadStatus(dir + "/status.jsonl").sequence.size() >= 1; }, 60000))
+        << ReadFile(dir + "/log.txt");
+    recorder.Signal(SIGINT);
+    ASSERT_EQ(recorder.Wait(60000), 0) << ReadFile(dir + "/log.txt");
+    const std::string log = ReadFile(dir + "/log.txt");
+    EXPECT_NE(log.find("SIGINT received"), std::string::npos);
+    EXPECT_NE(log.find("end of stream: storing what is held"), std::string::npos);
+    std::string last = log.substr(log.find_last_of('\n', log.size() - 2) + 1);
+    EXPECT_NE(last.find("Call Uninitialize."), std::string::npos) << last;
+    // Stopped long before the 8 s the whole clip takes at this rate.
+    auto objects = Objects(dir + "/store/rec");
+    EXPECT_GE(objects.size(), 1u);
+    EXPECT_LT(objects.size(), 4u);
+}
+
+TEST(EndToEndTest, InputsThatCannotBeRecordedEndWithStatusOne) {
+    const std::string dir = Scratch("bad");
+    const std::string audioOnly =
+        MediaClip("e2e_audio_only.m4a", {"-f", "lavfi", "-i", "sine=duration=1", "-c:a", "aac"});
+    struct Case {
+        std::string input;
+        std::string says;
+    } cases[] = {{dir + "/missing.mp4", "cannot open input \"" + dir + "/missing.mp4\""},
+                 {audioOnly, "has no H.264 or H.265 video"}};
+    for (const auto& c : cases) {
+        auto r = RunProcess(RecorderArgs(c.input, dir, {"-endpoint", "file://" + dir}), 60000);
+        EXPECT_EQ(r.exitStatus, 1);
+        const std::string log = ReadFile(dir + "/log.txt");
+        EXPECT_NE(log.find(c.says), std::string::npos) << log;
+        EXPECT_NE(log.find("Initialize Error."), std::string::npos);
+    }
+}
+
+TEST(EndToEndTest, SourceClockJumpsNeverMakeAGarbageDuration) {
+    const std::string clip = ShortClip();
+    const std::string dir = Scratch("jumps");
+    fs::create_directories(dir + "/store/rec");
+    // The same 4 s three times in one TS: the second two hours later, the third back at 0.
+    const std::string later = MediaClip(
+        "e2e_short_2h.ts", {"-i", clip, "-c", "copy", "-output_ts_offset", "7200", "-f", "mpegts"});
+    ASSERT_FALSE(later.empty());
+    const std::string jumpy = dir + "/jumpy.ts";
+    Concatenate({clip, later, clip}, jumpy);
+    auto r = RunProcess(
+        RecorderArgs(jumpy, dir, {"-readrate", "20", "-endpoint", "file://" + dir + "/store"}),
+        120000);
+    const std::string log = ReadFile(dir + "/log.txt");
+    ASSERT_EQ(r.exitStatus, 0) << log;
+    EXPECT_NE(log.find("jumped by"), std::string::npos);
+    Notified status = ReadStatus(dir + "/status.jsonl");
+    ASSERT_GE(status.sequence.size(), 6u) << log;
+    for (long d : status.durations) EXPECT_LE(d, 2500) << log;
+    for (const auto& object : Objects(dir + "/store/rec")) EXPECT_LT(Duration(object), 2.5);
+    EXPECT_LT(Duration(Concatenate(Objects(dir + "/store/rec"), dir + "/all.ts")), 13.0);
+}
+
+}  // namespace
