@@ -1,3 +1,5 @@
+// S3Store against s3rver on 127.0.0.1 (read back with awscli) and against scripted TCP peers
+// for the answers and failures s3rver cannot give.
 #include <arpa/inet.h>
 #include <gtest/gtest.h>
 #include <netinet/in.h>
@@ -6,7 +8,6 @@
 #include <unistd.h>
 
 #include <atomic>
-#include <fstream>
 #include <random>
 #include <thread>
 #include <vector>
@@ -53,14 +54,11 @@ S3StoreConfig Config(const std::string& endpoint) {
     return config;
 }
 
-// A TCP peer on 127.0.0.1 that plays a broken or scripted S3 server, on its own thread.
+// A TCP peer on 127.0.0.1, on its own thread, that stalls (accepts, never answers), resets each
+// connection, or reads each request (headers and Content-Length body) and sends `response`.
 class FakeServer {
   public:
-    enum class Mode {
-        kStall,    // accepts, never reads or answers
-        kReset,    // accepts and resets the connection at once
-        kRespond,  // reads the request (headers and Content-Length body), sends `response`
-    };
+    enum class Mode { kStall, kReset, kRespond };
     explicit FakeServer(Mode mode, std::string response = "")
         : mode_(mode), response_(std::move(response)) {
         listen_ = socket(AF_INET, SOCK_STREAM, 0);
@@ -79,9 +77,7 @@ class FakeServer {
         if (write(stop_[1], "x", 1) != 1) ADD_FAILURE() << "stop";
         thread_.join();
         for (int fd : held_) close(fd);
-        close(listen_);
-        close(stop_[0]);
-        close(stop_[1]);
+        for (int fd : {listen_, stop_[0], stop_[1]}) close(fd);
     }
     int Port() const { return port_; }
     std::string Endpoint() const { return "http://127.0.0.1:" + std::to_string(port_); }
@@ -101,14 +97,15 @@ class FakeServer {
             ++connections_;
             if (mode_ == Mode::kStall) {
                 held_.push_back(fd);
-            } else if (mode_ == Mode::kReset) {
+                continue;
+            }
+            if (mode_ == Mode::kReset) {
                 linger hard{1, 0};
                 setsockopt(fd, SOL_SOCKET, SO_LINGER, &hard, sizeof hard);
-                close(fd);
             } else {
                 Answer(fd);
-                close(fd);
             }
+            close(fd);
         }
     }
     void Answer(int fd) {
@@ -124,8 +121,8 @@ class FakeServer {
             size_t end = request.find("\r\n\r\n");
             if (wanted == std::string::npos && end != std::string::npos) {
                 size_t at = request.find("Content-Length: ");
-                size_t length = at == std::string::npos ? 0 : std::stoul(request.substr(at + 16));
-                wanted = end + 4 + length;
+                wanted =
+                    end + 4 + (at == std::string::npos ? 0 : std::stoul(request.substr(at + 16)));
             }
         }
         {
@@ -148,7 +145,7 @@ class FakeServer {
 };
 
 std::string HttpAnswer(const std::string& statusLine, const std::string& headers,
-                       const std::string& body) {
+                       const std::string& body = "") {
     return "HTTP/1.1 " + statusLine + "\r\n" + headers +
            "Content-Length: " + std::to_string(body.size()) + "\r\nConnection: close\r\n\r\n" +
            body;
@@ -162,12 +159,12 @@ std::string ErrorAnswer(const std::string& statusLine, const std::string& code) 
 
 class S3StoreTest : public ::testing::Test {
   protected:
-    void StartServer() {
+    void SetUp() override {
         ASSERT_TRUE(server_.Start(std::string(SFR_SOURCE_DIR) + "/scripts/s3rver.sh",
                                   testsupport::BuildPath("node")))
             << server_.Error();
     }
-    // Runs awscli against the server with the test key pair; returns its output.
+    // Runs awscli against the server with the test key pair.
     testsupport::ProcessResult Aws(std::vector<std::string> args) {
         std::vector<std::string> argv = {"env",
                                          std::string("AWS_ACCESS_KEY_ID=") + S3rver::kAccessKey,
@@ -189,20 +186,16 @@ class S3StoreTest : public ::testing::Test {
 }  // namespace
 
 TEST_F(S3StoreTest, StoresObjectsByteIdenticalWithMetadata) {
-    StartServer();
     S3Store store(Config(server_.Endpoint()));
-    // A key with every character that needs encoding in a path, and a second object over the
-    // same (reused) connection.
+    // Every character that needs encoding in a path; a second object over the reused connection.
     const std::string key = "pre fix/cam:1/2026/01/02/cam=1_20260102T030405.678Z_1 (a+b)!.ts";
-    const std::string body = RandomBytes(300 * 1024 + 17, 1);
+    const std::string body = RandomBytes(300 * 1024 + 17, 1), body2 = RandomBytes(1000, 2);
     FileTransferInfo info;
     ASSERT_EQ(store.Put(Object(key, body), Credentials(), &info), Success);
     EXPECT_EQ(info.fileSize, body.size());
-    const std::string body2 = RandomBytes(1000, 2);
     ObjectToStore second = Object("cam1/second.ts", body2);
     second.metadata["empty"] = "";  // signed and sent as an empty header
     ASSERT_EQ(store.Put(second, Credentials(), &info), Success);
-    EXPECT_EQ(info.fileSize, body2.size());
 
     const std::string copy = testsupport::BuildPath("s3store-copy-" + std::to_string(getpid()));
     auto cp = Aws({"s3", "cp", std::string("s3://") + S3rver::kBucket + "/" + key, copy});
@@ -212,61 +205,37 @@ TEST_F(S3StoreTest, StoresObjectsByteIdenticalWithMetadata) {
 
     auto head = Aws({"s3api", "head-object", "--bucket", S3rver::kBucket, "--key", key});
     ASSERT_EQ(head.exitStatus, 0) << head.output;
-    EXPECT_NE(head.output.find("\"ContentType\": \"video/mp2t\""), std::string::npos)
-        << head.output;
-    EXPECT_NE(head.output.find("\"streamingid\": \"cam 1\""), std::string::npos) << head.output;
-    EXPECT_NE(head.output.find("\"sequencenumber\": \"7\""), std::string::npos);
-    EXPECT_NE(head.output.find("\"duration\": \"10000\""), std::string::npos);
-    EXPECT_NE(head.output.find(digest::Hex(digest::Md5Of(body.data(), body.size()))),
-              std::string::npos);
+    for (const std::string& expected :
+         {std::string("\"ContentType\": \"video/mp2t\""), std::string("\"streamingid\": \"cam 1\""),
+          std::string("\"sequencenumber\": \"7\""), std::string("\"duration\": \"10000\""),
+          digest::Hex(digest::Md5Of(body.data(), body.size()))}) {
+        EXPECT_NE(head.output.find(expected), std::string::npos) << expected << head.output;
+    }
 }
 
-TEST_F(S3StoreTest, RejectionsFromTheServer) {
-    StartServer();
-    S3Store store(Config(server_.Endpoint()));
-    const std::string body = "0123456789";
+// Refusals, a clock 20 minutes ahead corrected from the refusal, and the server gone; nothing of
+// the credentials reaches the log at any priority.
+TEST_F(S3StoreTest, RejectionsAndSkewAndNoCredentialsInTheLog) {
+    LogCapture capture;
+    const std::string body = RandomBytes(4096, 3);
     FileTransferInfo info;
-    EXPECT_EQ(store.Put(Object("k.ts", body), Credentials("wrong-secret"), &info),
-              AuthenticationError);
+    S3StoreConfig skewed = Config(server_.Endpoint());
+    skewed.clockOffset = minutes(20);
+    S3Store store(skewed);
+    EXPECT_EQ(store.Put(Object("skew.ts", body), Credentials(), &info), RequestTimeTooSkewed);
+    EXPECT_LE(std::abs(store.ClockOffset().count()), 2);
+    EXPECT_EQ(store.Put(Object("skew.ts", body), Credentials(), &info), Success);
+
+    const StoreCredentials wrong = Credentials("wrong-secret-value");
+    EXPECT_EQ(store.Put(Object("k.ts", body), wrong, &info), AuthenticationError);
     EXPECT_EQ(info.fileSize, 0u);
     StoreCredentials unknown = Credentials();
     unknown.accessKey = "AKIDUNKNOWN";
     EXPECT_EQ(store.Put(Object("k.ts", body), unknown, &info), AuthenticationError);
     EXPECT_EQ(store.Put(Object("k.ts", body, "no-such-bucket"), Credentials(), &info),
               FilePathError);
-    EXPECT_EQ(store.Put(Object("k.ts", body), Credentials(), &info), Success);
-
-    // The server gone: the connection is refused.
     server_.Stop();
     EXPECT_EQ(store.Put(Object("k.ts", body), Credentials(), &info), NetworkError);
-}
-
-// A clock 20 minutes ahead is refused once; the store takes the server's time from that answer
-// and the retry succeeds.
-TEST_F(S3StoreTest, SkewedClockIsCorrectedByTheServersTime) {
-    StartServer();
-    S3StoreConfig config = Config(server_.Endpoint());
-    config.clockOffset = minutes(20);
-    S3Store store(config);
-    const std::string body = RandomBytes(4096, 3);
-    FileTransferInfo info;
-    EXPECT_EQ(store.Put(Object("skew.ts", body), Credentials(), &info), RequestTimeTooSkewed);
-    EXPECT_LE(std::abs(store.ClockOffset().count()), 2);
-    EXPECT_EQ(store.Put(Object("skew.ts", body), Credentials(), &info), Success);
-}
-
-TEST_F(S3StoreTest, CredentialsNeverReachTheLog) {
-    StartServer();
-    LogCapture capture;  // captures every priority
-    S3Store store(Config(server_.Endpoint()));
-    const std::string body = "payload";
-    FileTransferInfo info;
-    ASSERT_EQ(store.Put(Object("log.ts", body), Credentials(), &info), Success);
-    StoreCredentials wrong = Credentials("wrong-secret-value");
-    ASSERT_EQ(store.Put(Object("log.ts", body), wrong, &info), AuthenticationError);
-    FakeServer reset(FakeServer::Mode::kReset);
-    S3Store resetStore(Config(reset.Endpoint()));
-    ASSERT_EQ(resetStore.Put(Object("log.ts", body), Credentials(), &info), NetworkError);
 
     ASSERT_FALSE(capture.Records().empty());
     for (const auto& record : capture.Records()) {
@@ -280,11 +249,10 @@ TEST_F(S3StoreTest, CredentialsNeverReachTheLog) {
 }
 
 // What the request carries, as a scripted server receives it; and how scripted answers map.
-TEST_F(S3StoreTest, RequestHeadersAndScriptedAnswers) {
+TEST(S3StoreScriptedTest, RequestHeadersAndAnswers) {
     const std::string body = RandomBytes(70000, 4);
     const std::string md5Hex = digest::Hex(digest::Md5Of(body.data(), body.size()));
-    FakeServer ok(FakeServer::Mode::kRespond,
-                  HttpAnswer("200 OK", "ETag: \"" + md5Hex + "\"\r\n", ""));
+    FakeServer ok(FakeServer::Mode::kRespond, HttpAnswer("200 OK", "ETag: \"" + md5Hex + "\"\r\n"));
     S3Store store(Config(ok.Endpoint()));
     FileTransferInfo info;
     ASSERT_EQ(store.Put(Object("a b/c.ts", body), Credentials(), &info), Success);
@@ -292,16 +260,15 @@ TEST_F(S3StoreTest, RequestHeadersAndScriptedAnswers) {
     const std::string request = ok.Request();
     const std::string head = request.substr(0, request.find("\r\n\r\n") + 4);
     EXPECT_EQ(head.rfind("PUT /rec/a%20b/c.ts HTTP/1.1\r\n", 0), 0u) << head;
-    EXPECT_NE(head.find("content-md5: " + digest::Base64(digest::Md5Of(body.data(), body.size()))),
-              std::string::npos);
-    EXPECT_NE(head.find("x-amz-content-sha256: " +
-                        digest::Hex(digest::Sha256Of(body.data(), body.size()))),
-              std::string::npos);
-    EXPECT_NE(head.find("content-type: video/mp2t\r\n"), std::string::npos);
-    EXPECT_NE(head.find("x-amz-security-token: tok-EN/with+chars==\r\n"), std::string::npos);
-    EXPECT_NE(head.find("x-amz-meta-streamingid: cam 1\r\n"), std::string::npos);
-    EXPECT_NE(head.find("Host: 127.0.0.1:" + std::to_string(ok.Port()) + "\r\n"), std::string::npos)
-        << head;
+    for (const std::string& header :
+         {"content-md5: " + digest::Base64(digest::Md5Of(body.data(), body.size())) + "\r\n",
+          "x-amz-content-sha256: " + digest::Hex(digest::Sha256Of(body.data(), body.size())),
+          std::string("content-type: video/mp2t\r\n"),
+          std::string("x-amz-security-token: tok-EN/with+chars==\r\n"),
+          std::string("x-amz-meta-streamingid: cam 1\r\n"),
+          "Host: 127.0.0.1:" + std::to_string(ok.Port()) + "\r\n"}) {
+        EXPECT_NE(head.find(header), std::string::npos) << header << head;
+    }
     EXPECT_EQ(head.find("Expect:"), std::string::npos);
     EXPECT_TRUE(request.substr(head.size()) == body);
 
@@ -313,13 +280,9 @@ TEST_F(S3StoreTest, RequestHeadersAndScriptedAnswers) {
     EXPECT_NE(ok.Request().find("\r\nx-amz-meta-note: x__x-amz-acl: public-read\r\n"),
               std::string::npos);
 
-    struct Case {
-        std::string answer;
-        FileTransferResult expected;
-    };
-    const std::vector<Case> cases = {
-        {HttpAnswer("200 OK", "ETag: \"00000000000000000000000000000000\"\r\n", ""), FileBroken},
-        {HttpAnswer("200 OK", "", ""), FileBroken},
+    const std::pair<std::string, FileTransferResult> cases[] = {
+        {HttpAnswer("200 OK", "ETag: \"00000000000000000000000000000000\"\r\n"), FileBroken},
+        {HttpAnswer("200 OK", ""), FileBroken},
         {ErrorAnswer("500 Internal Server Error", "InternalError"), InternalError},
         {ErrorAnswer("503 Slow Down", "SlowDown"), InternalError},
         {ErrorAnswer("400 Bad Request", "BadDigest"), FileBroken},
@@ -328,44 +291,41 @@ TEST_F(S3StoreTest, RequestHeadersAndScriptedAnswers) {
         {ErrorAnswer("403 Forbidden", "TokenRefreshRequired"), AuthenticationError},
         {ErrorAnswer("404 Not Found", "NoSuchBucket"), FilePathError},
     };
-    for (const auto& c : cases) {
-        FakeServer server(FakeServer::Mode::kRespond, c.answer);
-        S3Store scripted(Config(server.Endpoint()));
-        EXPECT_EQ(scripted.Put(Object("k.ts", body), Credentials(), &info), c.expected) << c.answer;
+    for (const auto& [answer, expected] : cases) {
+        FakeServer server(FakeServer::Mode::kRespond, answer);
+        EXPECT_EQ(
+            S3Store(Config(server.Endpoint())).Put(Object("k.ts", body), Credentials(), &info),
+            expected)
+            << answer;
         EXPECT_EQ(info.fileSize, 0u);
     }
 }
 
-TEST_F(S3StoreTest, BrokenConnectionsAndMissingCredentials) {
-    FakeServer reset(FakeServer::Mode::kReset);
-    S3Store store(Config(reset.Endpoint()));
+TEST(S3StoreScriptedTest, BrokenConnectionsAndMissingCredentials) {
     FileTransferInfo info;
     const std::string body = RandomBytes(100000, 5);
-    EXPECT_EQ(store.Put(Object("k.ts", body), Credentials(), &info), NetworkError);
+    FakeServer reset(FakeServer::Mode::kReset);
+    EXPECT_EQ(S3Store(Config(reset.Endpoint())).Put(Object("k.ts", body), Credentials(), &info),
+              NetworkError);
+    EXPECT_EQ(S3Store(Config("http://no-such-host.invalid:9"))
+                  .Put(Object("k.ts", body), Credentials(), &info),
+              NetworkError);
 
     // Nothing is sent without credentials.
     FakeServer idle(FakeServer::Mode::kStall);
     S3Store idleStore(Config(idle.Endpoint()));
-    StoreCredentials none = Credentials();
-    none.secretKey.clear();
-    EXPECT_EQ(idleStore.Put(Object("k.ts", body), none, &info), AuthenticationError);
-    none = StoreCredentials{};
-    EXPECT_EQ(idleStore.Put(Object("k.ts", body), none, &info), AuthenticationError);
+    StoreCredentials noSecret = Credentials();
+    noSecret.secretKey.clear();
+    for (const StoreCredentials& none : {noSecret, StoreCredentials{}})
+        EXPECT_EQ(idleStore.Put(Object("k.ts", body), none, &info), AuthenticationError);
     EXPECT_EQ(idle.Connections(), 0);
 
-    S3StoreConfig unresolvable = Config("http://no-such-host.invalid:9");
-    EXPECT_EQ(S3Store(unresolvable).Put(Object("k.ts", body), Credentials(), &info), NetworkError);
-}
-
-TEST_F(S3StoreTest, StalledServerTimesOut) {
-    FakeServer stall(FakeServer::Mode::kStall);
-    S3StoreConfig config = Config(stall.Endpoint());
+    // A stalled server: the low-speed limit (1 s here) ends the transfer.
+    S3StoreConfig config = Config(idle.Endpoint());
     config.lowSpeedTimeS = 1;
-    S3Store store(config);
-    FileTransferInfo info;
-    const std::string body = RandomBytes(200, 6);  // a bigger body lifts curl's speed average
     auto started = steady_clock::now();
-    EXPECT_EQ(store.Put(Object("k.ts", body), Credentials(), &info), TimeOut);
+    EXPECT_EQ(S3Store(config).Put(Object("k.ts", body.substr(0, 200)), Credentials(), &info),
+              TimeOut);
     EXPECT_LT(steady_clock::now() - started, seconds(20));
     EXPECT_GE(info.responseTime, 900u);
 }
@@ -398,15 +358,13 @@ TEST(S3StoreConcurrencyTest, CancelEndsStalledTransferAndEveryLaterOne) {
 }
 
 TEST(S3StoreConfigTest, ParsesEndpoints) {
-    struct Case {
-        std::string url;
-        std::string normal;  // "" when rejected
-    };
-    const std::vector<Case> cases = {
+    const std::pair<std::string, std::string> cases[] = {
+        // url, normal form ("" when rejected)
         {"http://127.0.0.1:9000", "http://127.0.0.1:9000"},
         {"HTTPS://S3.Example.com/", "https://s3.example.com"},
         {"http://[::1]:8080", "http://[::1]:8080"},
         {"https://host:0443", "https://host:443"},
+        {"", ""},  // AWS itself: accepted, no endpoint
         {"ftp://host", ""},
         {"host:9000", ""},
         {"http://", ""},
@@ -418,21 +376,14 @@ TEST(S3StoreConfigTest, ParsesEndpoints) {
         {"http://ho st", ""},
         {"http://[::1", ""},
     };
-    for (const auto& c : cases) {
+    for (const auto& [url, normal] : cases) {
         S3StoreConfig config;
         std::string why;
-        bool ok = S3StoreConfig::Parse(c.url, config, why);
-        EXPECT_EQ(ok, !c.normal.empty()) << c.url;
-        if (ok) {
-            EXPECT_EQ(config.endpoint, c.normal);
-        } else {
-            EXPECT_FALSE(why.empty());
-        }
+        const bool ok = S3StoreConfig::Parse(url, config, why);
+        EXPECT_EQ(ok, url.empty() || !normal.empty()) << url;
+        EXPECT_EQ(ok ? config.endpoint : "", normal) << url;
+        EXPECT_TRUE(ok || !why.empty()) << url;
     }
-    S3StoreConfig aws;
-    std::string why;
-    EXPECT_TRUE(S3StoreConfig::Parse("", aws, why));
-    EXPECT_TRUE(aws.endpoint.empty());
 }
 
 TEST(S3StoreConfigTest, ReadsServerAnswers) {
@@ -440,8 +391,6 @@ TEST(S3StoreConfigTest, ReadsServerAnswers) {
     EXPECT_EQ(ClassifyS3Answer(403, "SomethingNew"), AuthenticationError);
     EXPECT_EQ(ClassifyS3Answer(301, "PermanentRedirect"), FilePathError);
     EXPECT_EQ(ClassifyS3Answer(400, "InvalidArgument"), InternalError);
-    EXPECT_EQ(ClassifyS3Answer(204, ""), Success);
-
     EXPECT_TRUE(
         EtagMatches("\"900150983CD24FB0D6963F7D28E17F72\"", "900150983cd24fb0d6963f7d28e17f72"));
     EXPECT_FALSE(
@@ -452,7 +401,6 @@ TEST(S3StoreConfigTest, ReadsServerAnswers) {
     EXPECT_EQ(system_clock::to_time_t(t), 1369353600);
     ASSERT_TRUE(ParseServerTime("2013-05-24T00:00:01Z", t));
     EXPECT_EQ(system_clock::to_time_t(t), 1369353601);
-    EXPECT_FALSE(ParseServerTime("yesterday", t));
     EXPECT_FALSE(ParseServerTime("Fri, 24 Foo 2013 00:00:00 GMT", t));
 }
 
@@ -464,24 +412,19 @@ TEST(S3StoreConfigTest, AddressesObjects) {
     EXPECT_EQ(t.url, "https://my-bucket.s3.eu-west-1.amazonaws.com/cam%201/a%2Bb.ts");
     EXPECT_EQ(t.host, "my-bucket.s3.eu-west-1.amazonaws.com");
     EXPECT_EQ(t.canonicalUri, "/cam%201/a%2Bb.ts");
-    EXPECT_EQ(t.signingRegion, "eu-west-1");
 
     routing.accelerate = true;
     ASSERT_TRUE(S3TargetFor("", "my-bucket", "k.ts", routing, t, why));
     EXPECT_EQ(t.url, "https://my-bucket.s3-accelerate.amazonaws.com/k.ts");
     EXPECT_EQ(t.signingRegion, "eu-west-1");
-
     // Acceleration is an AWS service: a custom endpoint stays path-style.
     ASSERT_TRUE(S3TargetFor("http://127.0.0.1:9000", "rec", "a/b c.ts", routing, t, why));
     EXPECT_EQ(t.url, "http://127.0.0.1:9000/rec/a/b%20c.ts");
     EXPECT_EQ(t.host, "127.0.0.1:9000");
-    EXPECT_EQ(t.canonicalUri, "/rec/a/b%20c.ts");
 
     routing = StoreCredentials{"ak", "sk", "", "", false};
     ASSERT_TRUE(S3TargetFor("", "b", "k", routing, t, why));
-    EXPECT_EQ(t.host, "b.s3.amazonaws.com");
     EXPECT_EQ(t.signingRegion, "us-east-1");
-
     EXPECT_FALSE(S3TargetFor("", "Bad_Bucket", "k", routing, t, why));
     EXPECT_FALSE(S3TargetFor("", "b", "", routing, t, why));
     routing.region = "eu-west-1.evil.example/";

@@ -66,18 +66,8 @@ std::shared_ptr<const void> AacParameters(std::mt19937_64& random) {
 }
 
 std::string RandomPayload(std::mt19937_64& random, TrackDescription::Kind kind) {
-    size_t size;
-    switch (random() % 8) {
-        case 0:
-            size = random() % 8;
-            break;
-        case 1:
-            size = random() % 70000;
-            break;
-        default:
-            size = random() % 3000;
-            break;
-    }
+    const uint64_t pick = random() % 8;  // mostly small, sometimes tiny or large
+    const size_t size = random() % (pick == 0 ? 8 : pick == 1 ? 70000 : 3000);
     std::string bytes(size, '\0');
     for (char& c : bytes) c = static_cast<char>(random());
     // Often a plausible start, so the muxer goes past its first checks.
@@ -133,19 +123,13 @@ TEST(SegmentWriterFuzzTest, RandomPayloadsNeverCrashOrReadPastAPayload) {
                 size_t count = random() % (t == 2 ? 6 : 40);
                 for (size_t i = 0; i < count; ++i) {
                     // Mostly regular steps; sometimes equal, backwards or far jumps.
-                    switch (random() % 16) {
-                        case 0:
-                            break;
-                        case 1:
-                            dts[t] -= static_cast<int64_t>(random() % 100000);
-                            break;
-                        case 2:
-                            dts[t] += static_cast<int64_t>(random() % (int64_t{1} << 40));
-                            break;
-                        default:
-                            dts[t] += step[t];
-                            break;
-                    }
+                    const uint64_t jump = random() % 16;
+                    if (jump == 1)
+                        dts[t] -= static_cast<int64_t>(random() % 100000);
+                    else if (jump == 2)
+                        dts[t] += static_cast<int64_t>(random() % (int64_t{1} << 40));
+                    else if (jump != 0)
+                        dts[t] += step[t];
                     SampleAttributes a;
                     a.attribute2 = static_cast<uint64_t>(dts[t]);
                     int64_t pts = dts[t] + static_cast<int64_t>(random() % 4) * step[t];

@@ -1,10 +1,10 @@
 // The TS objects of real clips: what ffprobe and ffmpeg read back, continuity across objects,
 // keys, and the results of requests the writer cannot or need not turn into an object.
-#include <ftw.h>
 #include <gtest/gtest.h>
 #include <stdlib.h>
 
 #include <algorithm>
+#include <filesystem>
 #include <fstream>
 #include <sstream>
 
@@ -30,19 +30,11 @@ class StoreDirectory {
     ~StoreDirectory() { RunProcess({"rm", "-rf", root_}); }
     const std::string& Root() const { return root_; }
     std::string Path(const std::string& key) const { return root_ + "/rec/" + key; }
-    // Every regular file under the root, relative to it.
+    // Every regular file under the root, with its path.
     std::vector<std::string> Files() const {
-        static std::vector<std::string>* found;
         std::vector<std::string> files;
-        found = &files;
-        nftw(
-            root_.c_str(),
-            [](const char* path, const struct stat*, int type, struct FTW*) {
-                if (type == FTW_F) found->push_back(path);
-                return 0;
-            },
-            8, FTW_PHYS);
-        for (auto& f : files) f = f.substr(root_.size() + 1);
+        for (const auto& entry : std::filesystem::recursive_directory_iterator(root_))
+            if (entry.is_regular_file()) files.push_back(entry.path().string());
         return files;
     }
 
@@ -89,46 +81,42 @@ std::vector<int64_t> PacketPts(const std::string& path, const std::string& type)
 
 struct ClipCase {
     const char* name;
-    const char* mp4;  // file name of the encoded clip
-    std::vector<std::string> videoArgs;
-    const char* codec;  // what ffprobe must call the video
-    bool withMeta;      // read through the TS copy with a timed ID3 track
+    const char* mp4;        // file name of the encoded clip
+    std::string videoArgs;  // ffmpeg's video encoding options
+    const char* codec;      // what ffprobe must call the video
+    bool withMeta;          // read through the TS copy with a timed ID3 track
 };
 
 void PrintTo(const ClipCase& c, std::ostream* os) {
     *os << c.name;
 }
 
+std::vector<std::string> Words(const std::string& text) {
+    std::vector<std::string> words;
+    std::istringstream in(text);
+    for (std::string word; in >> word;) words.push_back(word);
+    return words;
+}
+
 std::string MakeClip(const ClipCase& c) {
-    std::vector<std::string> args = {"-f",
-                                     "lavfi",
-                                     "-i",
-                                     std::string("testsrc2=size=320x240:rate=30:duration=6") +
-                                         (std::string(c.name).find("bframes") != std::string::npos
-                                              ? ",negate=enable='lt(mod(t,3.7),1.3)'"
-                                              : ""),
-                                     "-f",
-                                     "lavfi",
-                                     "-i",
-                                     "sine=frequency=440:sample_rate=48000:duration=6",
-                                     "-pix_fmt",
-                                     "yuv420p"};
-    args.insert(args.end(), c.videoArgs.begin(), c.videoArgs.end());
-    for (const char* a : {"-c:a", "aac", "-b:a", "64k"}) args.push_back(a);
+    const bool bframes = std::string(c.name).find("bframes") != std::string::npos;
+    std::vector<std::string> args =
+        Words(std::string("-f lavfi -i testsrc2=size=320x240:rate=30:duration=6") +
+              (bframes ? ",negate=enable='lt(mod(t,3.7),1.3)'" : "") +
+              " -f lavfi -i sine=frequency=440:sample_rate=48000:duration=6 -pix_fmt yuv420p " +
+              c.videoArgs + " -c:a aac -b:a 64k");
     std::string mp4 = MediaClip(c.mp4, args);
     if (mp4.empty() || !c.withMeta) return mp4;
     return ClipWithId3(mp4, std::string(c.mp4) + ".id3.ts");
 }
 
-const std::vector<std::string> kH264 = {"-c:v", "libx264",     "-preset", "ultrafast",     "-g",
-                                        "60",   "-keyint_min", "60",      "-sc_threshold", "0",
-                                        "-bf",  "0",           "-b:v",    "200k"};
-const std::vector<std::string> kH264BFrames = {
-    "-c:v", "libx264",       "-preset", "veryfast", "-g", "90",   "-keyint_min",
-    "15",   "-sc_threshold", "40",      "-bf",      "3",  "-b:v", "300k"};
-const std::vector<std::string> kH265 = {
-    "-c:v", "libx265", "-x265-params",
-    "keyint=60:min-keyint=60:scenecut=0:open-gop=0:bframes=0:log-level=error"};
+const char kH264[] =
+    "-c:v libx264 -preset ultrafast -g 60 -keyint_min 60 -sc_threshold 0 -bf 0 -b:v 200k";
+const char kH264BFrames[] =
+    "-c:v libx264 -preset veryfast -g 90 -keyint_min 15 -sc_threshold 40 -bf 3 -b:v 300k";
+const char kH265[] =
+    "-c:v libx265 -x265-params "
+    "keyint=60:min-keyint=60:scenecut=0:open-gop=0:bframes=0:log-level=error";
 
 class SegmentWriterClipTest : public ::testing::TestWithParam<ClipCase> {
   protected:
@@ -232,32 +220,29 @@ StreamData Sample(const std::shared_ptr<TrackDescription>& track, uint64_t ms, s
 TEST(SegmentTransferTest, RequestWithoutSamplesStoresNothing) {
     StoreDirectory dir;
     SegmentTransfer transfer(std::make_shared<LocalDirectoryStore>(dir.Root()), "");
-    FileTransferRequest request;
-    request.streamingId = "cam1";
-    request.bucketName = "rec";
-    request.sequenceNumber = 3;
-    request.duration = 10000;
+    FileTransferRequest request = ClipRequest(ClipSamples(), 0, 10000, 3);
     FileTransferInfo info;
-    info.fileSize = 99;
-    info.responseTime = 99;
+    info.fileSize = info.responseTime = 99;
     EXPECT_EQ(Success, transfer.Transfer(request, &info));
     EXPECT_EQ(0u, info.fileSize);
     EXPECT_EQ(0u, info.responseTime);
     EXPECT_TRUE(dir.Files().empty());
 }
 
-TEST(SegmentTransferTest, SamplesTheMuxerCannotTakeAreFileBroken) {
+TEST(SegmentTransferTest, RefusedSamplesAreFileBrokenAndCancelEndsEveryLaterTransfer) {
     StoreDirectory dir;
     SegmentTransfer transfer(std::make_shared<LocalDirectoryStore>(dir.Root()), "");
-    auto video = Track(TrackDescription::Kind::Video, "h264", 90000);
+    auto h264 = Track(TrackDescription::Kind::Video, "h264", 90000);
+    auto mpeg4 = Track(TrackDescription::Kind::Video, "mpeg4", 90000);
     FileTransferRequest request = ClipRequest(ClipSamples(), 0, 1, 1);
     // Length-prefixed, not Annex B: the muxer refuses the first access unit.
-    request.video.push_back(Sample(video, 0, std::string("\x00\x00\x00\x09\x65\x88", 6) + "abcd"));
+    request.video = {Sample(h264, 0, std::string("\x00\x00\x00\x09\x65\x88", 6) + "abcd")};
     EXPECT_EQ(FileBroken, transfer.Transfer(request, nullptr));
-
-    auto mpeg4 = Track(TrackDescription::Kind::Video, "mpeg4", 90000);
     request.video = {Sample(mpeg4, 0, H264Idr())};
     EXPECT_EQ(FileBroken, transfer.Transfer(request, nullptr));
+    request.video = {Sample(h264, 0, H264Idr())};
+    transfer.Cancel();
+    EXPECT_EQ(TimeOut, transfer.Transfer(request, nullptr));
     EXPECT_TRUE(dir.Files().empty());
 }
 
@@ -280,23 +265,11 @@ TEST(SegmentTransferTest, AudioThatCannotTravelInTsIsLeftOutOnce) {
     }
     std::vector<std::string> files = dir.Files();
     ASSERT_EQ(2u, files.size());
-    std::string object = dir.Root() + "/" + files[0];
-    EXPECT_EQ(std::vector<std::string>{"h264,video"}, Streams(object));
+    EXPECT_EQ(std::vector<std::string>{"h264,video"}, Streams(files[0]));
     size_t refusals = 0;
     for (const auto& r : log.Records())
         refusals += r.message.find("audio is left out") != std::string::npos;
     EXPECT_EQ(1u, refusals);
-}
-
-TEST(SegmentTransferTest, CancelEndsEveryLaterTransferWithTimeOut) {
-    StoreDirectory dir;
-    SegmentTransfer transfer(std::make_shared<LocalDirectoryStore>(dir.Root()), "");
-    auto video = Track(TrackDescription::Kind::Video, "h264", 90000);
-    FileTransferRequest request = ClipRequest(ClipSamples(), 0, 1, 1);
-    request.video.push_back(Sample(video, 0, H264Idr()));
-    transfer.Cancel();
-    EXPECT_EQ(TimeOut, transfer.Transfer(request, nullptr));
-    EXPECT_TRUE(dir.Files().empty());
 }
 
 TEST(ObjectKeyTest, KeyAndMetadataFollowTheFirstSamplesCaptureTime) {
