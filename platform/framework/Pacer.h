@@ -19,7 +19,7 @@
 class Pacer {
   public:
     static constexpr std::chrono::milliseconds kSlack{20};
-    static constexpr std::chrono::milliseconds kMediaSlack{50};
+    static constexpr std::chrono::milliseconds kMediaSlack{200};
 
     // `rate` <= 0: no pacing (Pace returns at once unless stopped).
     Pacer(double rate, StopSignal& stop);
