@@ -39,6 +39,8 @@ class MediaHost : public IModuleHost {
   public:
     // Pauses before reopening a live input: the first, and the most it grows to.
     static constexpr std::chrono::seconds kFirstReopenPause{1};
+    // Packets handed over together at most: fits the smallest module queue (20).
+    static constexpr size_t kMaxBatch = 16;
     static constexpr std::chrono::seconds kLongestReopenPause{30};
 
     // `handleSignals`: install the SIGINT/SIGTERM handlers while Run runs (the process's host

@@ -11,19 +11,27 @@ Pacer::Pacer(double rate, StopSignal& stop) : rate_(rate), stop_(stop), slack_(k
     }
 }
 
-bool Pacer::Pace(int64_t dtsUs) {
-    if (stop_.Raised()) return false;
-    if (rate_ <= 0) return true;
+std::chrono::steady_clock::time_point Pacer::dueTime(int64_t dtsUs) {
     const auto now = std::chrono::steady_clock::now();
     if (!started_) {
         started_ = true;
         firstUs_ = dtsUs;
         wallStart_ = now;
-        return true;
     }
-    if (dtsUs <= firstUs_) return true;
-    const auto due = wallStart_ + std::chrono::microseconds(static_cast<int64_t>(
-                                      static_cast<double>(dtsUs - firstUs_) / rate_));
-    if (due - now <= slack_) return true;
+    if (dtsUs <= firstUs_) return now;
+    return wallStart_ + std::chrono::microseconds(
+                            static_cast<int64_t>(static_cast<double>(dtsUs - firstUs_) / rate_));
+}
+
+bool Pacer::IsDue(int64_t dtsUs) {
+    if (rate_ <= 0) return true;
+    return dueTime(dtsUs) - std::chrono::steady_clock::now() <= slack_;
+}
+
+bool Pacer::Pace(int64_t dtsUs) {
+    if (stop_.Raised()) return false;
+    if (rate_ <= 0) return true;
+    const auto due = dueTime(dtsUs);
+    if (due - std::chrono::steady_clock::now() <= slack_) return true;
     return !stop_.WaitUntil(due);
 }

@@ -27,8 +27,14 @@ class Pacer {
     // Waits until the packet with decode time `dtsUs` (µs, shared clock) is due. False when
     // the stop signal was raised.
     bool Pace(int64_t dtsUs);
+    // True when Pace would let the packet go without waiting.
+    bool IsDue(int64_t dtsUs);
+    bool Paced() const { return rate_ > 0; }
 
   private:
+    // Wall-clock time at which the packet is due; the first call sets the start.
+    std::chrono::steady_clock::time_point dueTime(int64_t dtsUs);
+
     double rate_;
     StopSignal& stop_;
     std::chrono::steady_clock::duration slack_;  // the smaller of the two slacks, wall clock
