@@ -12,6 +12,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <chrono>
 #include <filesystem>
 #include <fstream>
 #include <regex>
@@ -213,8 +214,18 @@ void ExpectFramesOfTheInput(const std::string& clip, const std::string& codec, i
     ASSERT_LE(k + stored.size(), input.size());
     EXPECT_TRUE(std::equal(stored.begin(), stored.end(), input.begin() + k))
         << "stored frames are not a contiguous run of the input's";
-    // The end of the file is drained: the last object ends with the input's last frame.
+    // The end of the file is drained: the last object ends with the input's last frame, and
+    // the reported durations add up to the input's time from the first stored IDR to its end.
     EXPECT_EQ(k + stored.size(), input.size());
+    long reported = 0;
+    for (long d : status.durations) reported += d;
+    // Durations run on decode times: with B-frames the first IDR is decoded `reorder` frames
+    // before it is shown, and the audio runs on to the end of the last shown frame.
+    const double frameMs = 1000.0 / 30;
+    const int reorder = gop > 0 ? 0 : 2;  // gop 0: the clip with B-frames (3 at most)
+    EXPECT_NEAR(static_cast<double>(reported), (input.size() - k) * frameMs,
+                (1 + reorder) * frameMs + 1)
+        << "frames " << k << ".." << input.size();
     for (const auto& object : objects) {
         auto decode = RunProcess({"ffmpeg", "-v", "error", "-i", object, "-f", "null", "-"});
         EXPECT_TRUE(decode.output.empty()) << object << ": " << decode.output;
@@ -382,8 +393,9 @@ TEST(EndToEndTest, ToS3rverWithCredentialsFromACredentialProcess) {
     EXPECT_EQ(objects, status.sequence.size()) << listing.output;
 }
 
-int FreeUdpPort() {
-    int fd = socket(AF_INET, SOCK_DGRAM, 0);
+// A port on 127.0.0.1 that was free a moment ago (nothing listens on it afterwards).
+int FreePort(int type) {
+    int fd = socket(AF_INET, type, 0);
     sockaddr_in address{};
     address.sin_family = AF_INET;
     address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
@@ -392,6 +404,12 @@ int FreeUdpPort() {
     getsockname(fd, reinterpret_cast<sockaddr*>(&address), &length);
     close(fd);
     return ntohs(address.sin_port);
+}
+int FreeUdpPort() {
+    return FreePort(SOCK_DGRAM);
+}
+int FreeTcpPort() {
+    return FreePort(SOCK_STREAM);
 }
 
 TEST(EndToEndTest, LiveUdpInputThatStopsAndStartsAgainIsRecordedAcrossTheGap) {
@@ -447,6 +465,61 @@ TEST(EndToEndTest, LiveUdpInputThatStopsAndStartsAgainIsRecordedAcrossTheGap) {
     }
     // Both sendings are in the recording: more than the first one alone could give.
     EXPECT_GT(dts.back() - dts.front(), 3.5);
+}
+
+TEST(EndToEndTest, LiveInputWhoseSenderStopsKeepsItsTailOnSigterm) {
+    const std::string clip = ShortClip();
+    const std::string dir = Scratch("udp-tail");
+    fs::create_directories(dir + "/store/rec");
+    const std::string url = "udp://127.0.0.1:" + std::to_string(FreeUdpPort());
+    Child recorder(
+        RecorderArgs(url, dir, {"-uploadinterval", "2", "-endpoint", "file://" + dir + "/store"}),
+        dir + "/output.txt");
+    {
+        Child sender({"ffmpeg", "-v", "error", "-re", "-i", clip, "-c", "copy", "-f", "mpegts",
+                      url + "?pkt_size=1316"});
+        EXPECT_EQ(sender.Wait(60000), 0);
+    }
+    recorder.Signal(SIGTERM);
+    ASSERT_EQ(recorder.Wait(60000), 0) << ReadFile(dir + "/log.txt");
+    const std::string log = ReadFile(dir + "/log.txt");
+    EXPECT_NE(log.find("SIGTERM received"), std::string::npos) << log;
+    auto objects = Objects(dir + "/store/rec");
+    ASSERT_FALSE(objects.empty()) << log;
+    // The tail after the last regular cut is stored: the recording ends with the sent frames,
+    // but for the last one or two, which MPEG-TS over UDP leaves in the demuxer (a video PES
+    // ends only when the next one begins, and none comes).
+    const auto input = FrameHashes(clip);
+    const auto stored = FrameHashes(Concatenate(objects, dir + "/all.ts"));
+    ASSERT_FALSE(stored.empty());
+    auto last = std::find(input.begin(), input.end(), stored.back());
+    ASSERT_NE(last, input.end());
+    EXPECT_GE(last - input.begin(), static_cast<long>(input.size()) - 3) << log;
+}
+
+TEST(EndToEndTest, DrainAgainstAStoreThatIsDownEndsAtTheDrainTimeout) {
+    const std::string dir = Scratch("drain-down");
+    // Nothing listens on the endpoint: every transfer is a network error, waited out.
+    auto args = RecorderArgs(ShortClip(), dir,
+                             {"-readrate", "20", "-draintimeout", "2", "-endpoint",
+                              "http://127.0.0.1:" + std::to_string(FreeTcpPort())});
+    args.insert(args.begin(), {"env", "AWS_ACCESS_KEY_ID=AKID", "AWS_SECRET_ACCESS_KEY=secret",
+                               "AWS_SESSION_TOKEN=token"});
+    auto start = std::chrono::steady_clock::now();
+    auto r = RunProcess(args, 60000);
+    auto took = std::chrono::steady_clock::now() - start;
+    const std::string log = ReadFile(dir + "/log.txt");
+    EXPECT_EQ(r.exitStatus, 0) << log;
+    EXPECT_LT(took, std::chrono::seconds(20));
+    std::smatch m;
+    ASSERT_TRUE(
+        std::regex_search(log, m,
+                          std::regex("drain incomplete after 2000 ms: ([0-9]+) stream files "
+                                     "\\(([0-9]+) ms of stream\\) left to the disconnection")))
+        << log;
+    EXPECT_GE(std::stol(m[1]), 1);
+    EXPECT_GE(std::stol(m[2]), 1000);
+    EXPECT_NE(log.find("Call Uninitialize."), std::string::npos);
 }
 
 TEST(EndToEndTest, SigintEndsARunInOrderWithExitCodeZero) {
