@@ -31,8 +31,7 @@ bool BaseProcess::Initialize() {
     // The module's option messages come first: they are what a user most often gets wrong.
     if (!initializeProcess(std::string())) return false;
     for (const auto& error : optionErrors_) {
-        Logger::Put(4, kFile, "BaseProcess::Initialize", __LINE__, "bad option: %s",
-                    error.c_str());
+        Logger::Put(4, kFile, "BaseProcess::Initialize", __LINE__, "bad option: %s", error.c_str());
     }
     if (!optionErrors_.empty()) return false;
     if (!status_.Open(options_.statusPath)) {
@@ -87,9 +86,13 @@ bool BaseProcess::GetArgument_int(std::string name, int& value, int, int) {
     return CommandLine::ParseInt(text, value);
 }
 
-std::string BaseProcess::GetStreamingId() { return options_.streamingId; }
+std::string BaseProcess::GetStreamingId() {
+    return options_.streamingId;
+}
 
-std::string BaseProcess::getParentStreamName() { return options_.parent; }
+std::string BaseProcess::getParentStreamName() {
+    return options_.parent;
+}
 
 void BaseProcess::SetProcessStatus(VqProcessState state, unsigned int code) {
     std::shared_ptr<IModuleHost> host;
@@ -134,24 +137,40 @@ VqResult BaseProcess::SendLastSequenceNumNotify(const std::string& destination,
     return VQ_OK;
 }
 
-VqResult BaseProcess::notifyModuleConnectionRequestReply(ConnectResponse&) { return VQ_OK; }
+VqResult BaseProcess::notifyModuleConnectionRequestReply(ConnectResponse&) {
+    return VQ_OK;
+}
 
 VqResult BaseProcess::notifyInputOutputDisconnectionRequest(DisconnectInputRequest&) {
     return VQ_OK;
 }
 
-VqResult BaseProcess::notifyGetAWSTokenRequest(GetAWSSecureTokenRequest&) { return VQ_OK; }
+VqResult BaseProcess::notifyGetAWSTokenRequest(GetAWSSecureTokenRequest&) {
+    return VQ_OK;
+}
 
-VqResult BaseProcess::notifyLastSequenceNumNotify(LastSequenceNumNotify&) { return VQ_OK; }
+VqResult BaseProcess::notifyLastSequenceNumNotify(LastSequenceNumNotify&) {
+    return VQ_OK;
+}
 
-VqResult BaseProcess::notifyTransmissionStatus(TransferStatusNotify&) { return VQ_OK; }
+VqResult BaseProcess::notifyTransmissionStatus(TransferStatusNotify&) {
+    return VQ_OK;
+}
 
-bool BaseProcess::initializeProcess(std::string) { return true; }
+bool BaseProcess::initializeProcess(std::string) {
+    return true;
+}
 
 void BaseProcess::stopProcess() {}
 
-bool BaseProcess::startProcess() { return true; }
+bool BaseProcess::startProcess() {
+    return true;
+}
 
-bool BaseProcess::setProperties(std::map<std::string, std::string>&) { return true; }
+bool BaseProcess::setProperties(std::map<std::string, std::string>&) {
+    return true;
+}
 
-bool BaseProcess::drainProcess(int64_t) { return true; }
+bool BaseProcess::drainProcess(int64_t) {
+    return true;
+}

@@ -28,12 +28,12 @@
 #include "platform/framework/VqResult.h"
 
 class IVqModuleMessageObserver {
-public:
+  public:
     virtual ~IVqModuleMessageObserver() = default;
 };
 
 class IReceiveStreamObserver {
-public:
+  public:
     virtual ~IReceiveStreamObserver() = default;
     virtual void notifyVideoData(std::shared_ptr<ReceivedSample> sample) = 0;
     virtual void notifyAudioData(std::shared_ptr<ReceivedSample> sample) = 0;
@@ -41,12 +41,12 @@ public:
 };
 
 class ISendStreamObserver {
-public:
+  public:
     virtual ~ISendStreamObserver() = default;
 };
 
 class IStreamDataSender {
-public:
+  public:
     virtual ~IStreamDataSender() = default;
 };
 
@@ -54,7 +54,7 @@ class BaseProcess : public IVqModuleMessageObserver,
                     public IReceiveStreamObserver,
                     public ISendStreamObserver,
                     public IStreamDataSender {
-public:
+  public:
     BaseProcess(int argc, char** argv, bool, bool);
     ~BaseProcess() override;
     BaseProcess(const BaseProcess&) = delete;
@@ -107,7 +107,7 @@ public:
     void notifyAudioData(std::shared_ptr<ReceivedSample>) override {}
     void notifyMetaData(std::shared_ptr<ReceivedSample>) override {}
 
-private:
+  private:
     std::shared_ptr<IModuleHost> hostSnapshot();
 
     CommandLine commandLine_;

@@ -1,8 +1,8 @@
 #include "platform/framework/FrameworkOptions.h"
 
+#include <cctype>
 #include <cerrno>
 #include <climits>
-#include <cctype>
 #include <cmath>
 #include <cstdlib>
 #include <mutex>

@@ -9,7 +9,7 @@
 
 // Reads `-name value` pairs out of argv. Thread-safe after construction (read-only).
 class CommandLine {
-public:
+  public:
     CommandLine(int argc, char** argv);
     // True and the value when `-name` is given with a value.
     bool Find(const std::string& name, std::string& value) const;
@@ -17,25 +17,25 @@ public:
     static bool ParseInt(const std::string& text, int& value);
     static bool ParseDouble(const std::string& text, double& value);
 
-private:
+  private:
     std::vector<std::string> args_;
 };
 
 struct FrameworkOptions {
-    std::string input;              // -input: file or URL to record; empty: none
-    std::string streamingId;        // -streamingid, default: the input's base name
-    std::string parent = "host";    // -parent: destination of every message
-    double readRate = -1;           // -readrate: <0 default (1 for files)
-    double durationSeconds = -1;    // -duration: <0 none
-    double drainTimeoutSeconds = 30;  // -draintimeout
-    std::string endpoint;           // -endpoint or AWS_ENDPOINT_URL_S3 / AWS_ENDPOINT_URL
-    std::string region;             // -region or AWS_REGION / AWS_DEFAULT_REGION / us-east-1
-    std::string credentialProcess;  // -credentialprocess
+    std::string input;                 // -input: file or URL to record; empty: none
+    std::string streamingId;           // -streamingid, default: the input's base name
+    std::string parent = "host";       // -parent: destination of every message
+    double readRate = -1;              // -readrate: <0 default (1 for files)
+    double durationSeconds = -1;       // -duration: <0 none
+    double drainTimeoutSeconds = 30;   // -draintimeout
+    std::string endpoint;              // -endpoint or AWS_ENDPOINT_URL_S3 / AWS_ENDPOINT_URL
+    std::string region;                // -region or AWS_REGION / AWS_DEFAULT_REGION / us-east-1
+    std::string credentialProcess;     // -credentialprocess
     std::string segmentFormat = "ts";  // -segmentformat
-    std::string keyPrefix;          // -keyprefix
-    int logLevel = 11;              // -loglevel
-    std::string logFile;            // -logfile, empty: stderr
-    std::string statusPath = "-";   // -status, "-": stdout
+    std::string keyPrefix;             // -keyprefix
+    int logLevel = 11;                 // -loglevel
+    std::string logFile;               // -logfile, empty: stderr
+    std::string statusPath = "-";      // -status, "-": stdout
 
     // Reads every option; problems (unreadable numbers) are appended to `errors`, and the
     // option keeps its default.

@@ -13,7 +13,7 @@
 class BaseProcess;
 
 class IModuleHost {
-public:
+  public:
     virtual ~IModuleHost() = default;
 
     // After the module's initializeProcess: open the input, check the set-up. False ends

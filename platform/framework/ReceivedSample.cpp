@@ -37,18 +37,19 @@ ReceivedSample::ReceivedSample(const SampleAttributes::Block& attributes, const 
 
 uint64_t ReceivedSample::ReadU64(size_t offset) const {
     uint64_t value = 0;
-    for (size_t i = 0; i < 8; ++i) value |= static_cast<uint64_t>(attributes_[offset + i]) << (8 * i);
+    for (size_t i = 0; i < 8; ++i)
+        value |= static_cast<uint64_t>(attributes_[offset + i]) << (8 * i);
     return value;
 }
 
 uint32_t ReceivedSample::ReadU32(size_t offset) const {
     uint32_t value = 0;
-    for (size_t i = 0; i < 4; ++i) value |= static_cast<uint32_t>(attributes_[offset + i]) << (8 * i);
+    for (size_t i = 0; i < 4; ++i)
+        value |= static_cast<uint32_t>(attributes_[offset + i]) << (8 * i);
     return value;
 }
 
-std::shared_ptr<ReceivedSample> MakeReceivedSample(SampleAttributes attributes,
-                                                   std::string payload,
+std::shared_ptr<ReceivedSample> MakeReceivedSample(SampleAttributes attributes, std::string payload,
                                                    std::shared_ptr<const TrackDescription> track) {
     auto owner = std::make_shared<const std::string>(std::move(payload));
     attributes.payloadSize = owner->size();

@@ -11,20 +11,19 @@
 #include "platform/framework/VqResult.h"
 
 class StatusWriter {
-public:
+  public:
     StatusWriter() = default;
     ~StatusWriter();
     // "-" is stdout. False when the file cannot be opened.
     bool Open(const std::string& path);
 
     void WriteTokenRequest(const std::string& destination, const GetAWSSecureTokenRequest& m);
-    void WriteLastSequenceNumNotify(const std::string& destination,
-                                    const LastSequenceNumNotify& m);
+    void WriteLastSequenceNumNotify(const std::string& destination, const LastSequenceNumNotify& m);
     void WriteTransmissionStatus(const std::string& destination, const TransferStatusNotify& m);
     void WriteProcessStatus(const std::string& destination, VqProcessState state,
                             unsigned int code);
 
-private:
+  private:
     void writeLine(const std::string& line);
 
     std::mutex mutex_;

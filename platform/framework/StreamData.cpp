@@ -15,6 +15,10 @@ StreamData::StreamData(std::shared_ptr<ReceivedSample> sample)
       source(std::move(sample)),
       attribute7(source->ReadU64(88)) {}
 
-const uint8_t* StreamData::PayloadData() const { return source ? source->Data() : nullptr; }
+const uint8_t* StreamData::PayloadData() const {
+    return source ? source->Data() : nullptr;
+}
 
-size_t StreamData::PayloadBytes() const { return source ? source->Size() : 0; }
+size_t StreamData::PayloadBytes() const {
+    return source ? source->Size() : 0;
+}

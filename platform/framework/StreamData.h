@@ -16,7 +16,7 @@
 class ReceivedSample;
 
 class StreamData {
-public:
+  public:
     StreamData() = default;
     explicit StreamData(std::shared_ptr<ReceivedSample> sample);
     StreamData(const StreamData&) = default;
@@ -27,7 +27,7 @@ public:
     uint64_t timestamp = 0;  // ms on the clock that video, audio and meta share
     uint64_t attribute1 = 0;
     uint64_t attribute2 = 0;
-    uint64_t attribute3[2] = {0, 0};  // one 16-byte unit
+    uint64_t attribute3[2] = {0, 0};   // one 16-byte unit
     std::shared_ptr<void> dataHolder;  // empty in every record the recorder makes
     uint64_t payloadSize = 0;          // bytes; 0 marks a marker sample
     uint32_t attribute4 = 0;

@@ -15,7 +15,7 @@
 #include "platform/framework/BaseProcess.h"
 
 class TestHost : public IModuleHost {
-public:
+  public:
     struct StatusChange {
         VqProcessState state;
         unsigned int code;
@@ -49,7 +49,7 @@ public:
     void OnTransmissionStatus(const TransferStatusNotify& m) override;
     void OnProcessStatus(VqProcessState state, unsigned int code) override;
 
-private:
+  private:
     BaseProcess* process() const;
 
     mutable std::mutex mutex_;
