@@ -2,13 +2,11 @@
 // input's frames; credentials from a credential process against s3rver; a live UDP input that
 // stops and starts again; SIGINT; inputs it cannot record; sources with broken clocks.
 #include <arpa/inet.h>
-#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <netinet/in.h>
 #include <signal.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -30,9 +28,13 @@ using testsupport::BuildPath;
 using testsupport::MediaClip;
 using testsupport::ReadFile;
 using testsupport::RunProcess;
+using testsupport::Words;
+using Child = testsupport::ChildProcess;
+using Args = std::vector<std::string>;
 
-std::string Recorder() {
-    return BuildPath("src/stream-file-recorder");
+Args operator+(Args a, const Args& b) {
+    a.insert(a.end(), b.begin(), b.end());
+    return a;
 }
 
 // A fresh directory per test under the build tree.
@@ -43,70 +45,41 @@ std::string Scratch(const std::string& name) {
     return dir;
 }
 
-std::vector<std::string> RecorderArgs(const std::string& input, const std::string& dir,
-                                      std::vector<std::string> extra) {
-    std::vector<std::string> args = {Recorder(),
-                                     "-input",
-                                     input,
-                                     "-uploadinterval",
-                                     "1",
-                                     "-bufferfullsize",
-                                     "100",
-                                     "-authretrytime",
-                                     "3000",
-                                     "-kct",
-                                     "h264",
-                                     "-bucketname",
-                                     "rec",
-                                     "-status",
-                                     dir + "/status.jsonl",
-                                     "-logfile",
-                                     dir + "/log.txt"};
-    args.insert(args.end(), extra.begin(), extra.end());
-    return args;
+// A local store under `dir` with the bucket "rec"; its -endpoint.
+std::string Store(const std::string& dir) {
+    fs::create_directories(dir + "/store/rec");
+    return "file://" + dir + "/store";
 }
 
-// A child process that runs while the test goes on.
-class Child {
-  public:
-    explicit Child(const std::vector<std::string>& argv, const std::string& output = "/dev/null") {
-        pid_ = fork();
-        if (pid_ == 0) {
-            int fd = open(output.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
-            if (fd >= 0) {
-                dup2(fd, 1);
-                dup2(fd, 2);
-            }
-            std::vector<char*> args;
-            for (const auto& a : argv) args.push_back(const_cast<char*>(a.c_str()));
-            args.push_back(nullptr);
-            execvp(args[0], args.data());
-            _exit(127);
-        }
-    }
-    ~Child() {
-        if (pid_ > 0 && !done_) {
-            kill(pid_, SIGKILL);
-            waitpid(pid_, nullptr, 0);
-        }
-    }
-    void Signal(int signo) { kill(pid_, signo); }
-    // Exit status, or -1 when killed by a signal or still running after `timeoutMs`.
-    int Wait(int timeoutMs) {
-        if (!done_) {
-            int status = 0;
-            done_ = testsupport::WaitUntil([&] { return waitpid(pid_, &status, WNOHANG) == pid_; },
-                                           timeoutMs);
-            if (done_ && WIFEXITED(status)) status_ = WEXITSTATUS(status);
-        }
-        return status_;
-    }
+Args RecorderArgs(const std::string& input, const std::string& dir, const Args& extra) {
+    return Args{BuildPath("src/stream-file-recorder"), "-input", input} +
+           Words(
+               "-uploadinterval 1 -bufferfullsize 100 -authretrytime 3000 -kct h264 "
+               "-bucketname rec") +
+           Args{"-status", dir + "/status.jsonl", "-logfile", dir + "/log.txt"} + extra;
+}
 
-  private:
-    pid_t pid_ = -1;
-    bool done_ = false;
-    int status_ = -1;
-};
+// `seconds` of 30 fps test pattern (through `filter`, if any) and a 48 kHz tone, the video
+// encoded with `video`.
+std::string Clip(const std::string& name, int seconds, const std::string& video,
+                 const std::string& filter = "") {
+    const std::string length = "duration=" + std::to_string(seconds);
+    return MediaClip(name, Words("-f lavfi -i testsrc2=size=320x240:rate=30:" + length + filter +
+                                 " -f lavfi -i sine=frequency=440:sample_rate=48000:" + length +
+                                 " -pix_fmt yuv420p -c:a aac -b:a 64k " + video));
+}
+const char kX264Gop30[] =
+    "-c:v libx264 -preset ultrafast -g 30 -keyint_min 30 -sc_threshold 0 -bf 0";
+
+std::string ShortClip() {
+    return Clip("e2e_short.ts", 4, kX264Gop30);
+}
+
+// Sends `clip` in real time as MPEG-TS to `url`.
+Args Sender(const std::string& clip, const std::string& url) {
+    return Words("ffmpeg -v error -re -i") + Args{clip} + Words("-c copy -f mpegts") +
+           Args{url + "?pkt_size=1316"};
+}
 
 // The stored objects in the order of their sequence numbers.
 std::vector<std::string> Objects(const std::string& dir) {
@@ -131,19 +104,27 @@ std::string Concatenate(const std::vector<std::string>& objects, const std::stri
     return out;
 }
 
+// The non-empty, non-comment lines of a program's output.
+std::vector<std::string> OutputLines(const Args& argv) {
+    std::istringstream in(RunProcess(argv, 120000).output);
+    std::vector<std::string> lines;
+    for (std::string line; std::getline(in, line);)
+        if (!line.empty() && line[0] != '#') lines.push_back(line);
+    return lines;
+}
+
 // The MD5 of every decoded video frame, in output order.
 std::vector<std::string> FrameHashes(const std::string& path) {
-    auto r = RunProcess({"ffmpeg", "-v", "error", "-i", path, "-map", "0:v", "-fps_mode",
-                         "passthrough", "-f", "framemd5", "-"},
-                        120000);
-    std::vector<std::string> hashes;
-    std::istringstream lines(r.output);
-    std::string line;
-    while (std::getline(lines, line)) {
-        if (line.empty() || line[0] == '#') continue;
-        hashes.push_back(line.substr(line.find_last_of(", ") + 1));
-    }
+    auto hashes = OutputLines(Words("ffmpeg -v error -i") + Args{path} +
+                              Words("-map 0:v -fps_mode passthrough -f framemd5 -"));
+    for (auto& line : hashes) line = line.substr(line.find_last_of(", ") + 1);
     return hashes;
+}
+
+double Duration(const std::string& path) {
+    auto r = RunProcess(Words("ffprobe -v error -show_entries format=duration -of csv=p=0") +
+                        Args{path});
+    return std::atof(r.output.c_str());
 }
 
 // The sequence numbers and durations of the LastSequenceNumNotify lines.
@@ -156,9 +137,8 @@ struct Notified {
 Notified ReadStatus(const std::string& path) {
     Notified n;
     std::istringstream lines(ReadFile(path));
-    std::string line;
     std::regex seq("\"sequenceNumber\":([0-9]+),\"succeeded\":true.*\"duration\":([0-9]+)");
-    while (std::getline(lines, line)) {
+    for (std::string line; std::getline(lines, line);) {
         std::smatch m;
         if (line.find("\"LastSequenceNumNotify\"") != std::string::npos &&
             std::regex_search(line, m, seq)) {
@@ -169,228 +149,6 @@ Notified ReadStatus(const std::string& path) {
         n.uploadInfos += line.find("\"UploadInfo\"") != std::string::npos;
     }
     return n;
-}
-
-double Duration(const std::string& path) {
-    auto r = RunProcess(
-        {"ffprobe", "-v", "error", "-show_entries", "format=duration", "-of", "csv=p=0", path});
-    return std::atof(r.output.c_str());
-}
-
-// Records `clip` into a local directory and checks the objects against the input's frames.
-// `interval` must be longer than the clip's longest GOP, so that every object begins with an
-// IDR and decodes on its own (a longer GOP is split, and the object holding its rest does not).
-void ExpectFramesOfTheInput(const std::string& clip, const std::string& codec, int gop,
-                            const std::string& interval = "1") {
-    ASSERT_FALSE(clip.empty());
-    const std::string dir = Scratch("frames-" + codec + "-" + std::to_string(gop));
-    fs::create_directories(dir + "/store/rec");
-    auto r = RunProcess(RecorderArgs(clip, dir,
-                                     {"-kct", codec, "-readrate", "10", "-uploadinterval", interval,
-                                      "-endpoint", "file://" + dir + "/store"}),
-                        120000);
-    const std::string log = ReadFile(dir + "/log.txt");
-    ASSERT_EQ(r.exitStatus, 0) << r.output << log;
-    EXPECT_EQ(log.find("queue overflow"), std::string::npos);
-    auto objects = Objects(dir + "/store/rec");
-    ASSERT_GE(objects.size(), 2u) << log;
-
-    Notified status = ReadStatus(dir + "/status.jsonl");
-    ASSERT_EQ(status.sequence.size(), objects.size());
-    for (size_t i = 0; i < status.sequence.size(); ++i) {
-        EXPECT_EQ(status.sequence[i], static_cast<long>(i + 1));
-    }
-    EXPECT_EQ(status.uploadInfos, objects.size());
-
-    const auto input = FrameHashes(clip);
-    const auto stored = FrameHashes(Concatenate(objects, dir + "/all.ts"));
-    ASSERT_FALSE(stored.empty());
-    auto first = std::find(input.begin(), input.end(), stored.front());
-    ASSERT_NE(first, input.end());
-    const size_t k = static_cast<size_t>(first - input.begin());
-    if (gop > 0) {
-        EXPECT_EQ(k % gop, 0u) << "the first stored frame is not an IDR";
-    }
-    ASSERT_LE(k + stored.size(), input.size());
-    EXPECT_TRUE(std::equal(stored.begin(), stored.end(), input.begin() + k))
-        << "stored frames are not a contiguous run of the input's";
-    // The end of the file is drained: the last object ends with the input's last frame, and
-    // the reported durations add up to the input's time from the first stored IDR to its end.
-    EXPECT_EQ(k + stored.size(), input.size());
-    long reported = 0;
-    for (long d : status.durations) reported += d;
-    // Durations run on decode times: with B-frames the first IDR is decoded `reorder` frames
-    // before it is shown, and the audio runs on to the end of the last shown frame.
-    const double frameMs = 1000.0 / 30;
-    const int reorder = gop > 0 ? 0 : 2;  // gop 0: the clip with B-frames (3 at most)
-    EXPECT_NEAR(static_cast<double>(reported), (input.size() - k) * frameMs,
-                (1 + reorder) * frameMs + 1)
-        << "frames " << k << ".." << input.size();
-    for (const auto& object : objects) {
-        auto decode = RunProcess({"ffmpeg", "-v", "error", "-i", object, "-f", "null", "-"});
-        EXPECT_TRUE(decode.output.empty()) << object << ": " << decode.output;
-    }
-}
-
-TEST(EndToEndTest, StoredObjectsDecodeToTheInputsFramesH264) {
-    ExpectFramesOfTheInput(
-        MediaClip("e2e_h264.mp4", {"-f",
-                                   "lavfi",
-                                   "-i",
-                                   "testsrc2=size=320x240:rate=30:duration=5",
-                                   "-f",
-                                   "lavfi",
-                                   "-i",
-                                   "sine=frequency=440:sample_rate=48000:duration=5",
-                                   "-c:v",
-                                   "libx264",
-                                   "-preset",
-                                   "ultrafast",
-                                   "-pix_fmt",
-                                   "yuv420p",
-                                   "-g",
-                                   "30",
-                                   "-keyint_min",
-                                   "30",
-                                   "-sc_threshold",
-                                   "0",
-                                   "-bf",
-                                   "0",
-                                   "-c:a",
-                                   "aac",
-                                   "-b:a",
-                                   "64k"}),
-        "h264", 30);
-}
-
-TEST(EndToEndTest, StoredObjectsDecodeToTheInputsFramesH264WithBFrames) {
-    ExpectFramesOfTheInput(
-        MediaClip("e2e_h264_bframes.ts",
-                  {"-f",
-                   "lavfi",
-                   "-i",
-                   "testsrc2=size=320x240:rate=30:duration=6,negate=enable='lt(mod(t,3.7),1.3)'",
-                   "-f",
-                   "lavfi",
-                   "-i",
-                   "sine=frequency=440:sample_rate=48000:duration=6",
-                   "-c:v",
-                   "libx264",
-                   "-preset",
-                   "veryfast",
-                   "-pix_fmt",
-                   "yuv420p",
-                   "-g",
-                   "90",
-                   "-keyint_min",
-                   "15",
-                   "-sc_threshold",
-                   "40",
-                   "-bf",
-                   "3",
-                   "-c:a",
-                   "aac",
-                   "-b:a",
-                   "64k"}),
-        "h264", 0, "4");
-}
-
-TEST(EndToEndTest, StoredObjectsDecodeToTheInputsFramesH265) {
-    ExpectFramesOfTheInput(
-        MediaClip("e2e_h265.mp4",
-                  {"-f",
-                   "lavfi",
-                   "-i",
-                   "testsrc2=size=320x240:rate=30:duration=5",
-                   "-f",
-                   "lavfi",
-                   "-i",
-                   "sine=frequency=440:sample_rate=48000:duration=5",
-                   "-c:v",
-                   "libx265",
-                   "-preset",
-                   "ultrafast",
-                   "-x265-params",
-                   "keyint=30:min-keyint=30:scenecut=0:open-gop=0:bframes=0:log-level=error",
-                   "-pix_fmt",
-                   "yuv420p",
-                   "-c:a",
-                   "aac",
-                   "-b:a",
-                   "64k"}),
-        "h265", 30);
-}
-
-std::string ShortClip() {
-    return MediaClip("e2e_short.ts", {"-f",
-                                      "lavfi",
-                                      "-i",
-                                      "testsrc2=size=320x240:rate=30:duration=4",
-                                      "-f",
-                                      "lavfi",
-                                      "-i",
-                                      "sine=frequency=440:sample_rate=48000:duration=4",
-                                      "-c:v",
-                                      "libx264",
-                                      "-preset",
-                                      "ultrafast",
-                                      "-pix_fmt",
-                                      "yuv420p",
-                                      "-g",
-                                      "30",
-                                      "-keyint_min",
-                                      "30",
-                                      "-sc_threshold",
-                                      "0",
-                                      "-bf",
-                                      "0",
-                                      "-c:a",
-                                      "aac",
-                                      "-b:a",
-                                      "64k"});
-}
-
-TEST(EndToEndTest, ToS3rverWithCredentialsFromACredentialProcess) {
-    testsupport::S3rver server;
-    ASSERT_TRUE(server.Start(std::string(SFR_SOURCE_DIR) + "/scripts/s3rver.sh", BuildPath("node")))
-        << server.Error();
-    const std::string dir = Scratch("s3");
-    // The first answer carries a wrong secret; every later one the right key pair.
-    const std::string script = dir + "/credentials.sh";
-    std::ofstream(script) << "#!/bin/sh\n"
-                          << "count=" << dir << "/count\n"
-                          << "echo x >> \"$count\"\n"
-                          << "secret=" << testsupport::S3rver::kSecretKey << "\n"
-                          << "[ \"$(wc -l < \"$count\")\" -eq 1 ] && secret=wrong-secret\n"
-                          << "printf '{\"Version\":1,\"AccessKeyId\":\"%s\",\"SecretAccessKey\":"
-                             "\"%s\",\"SessionToken\":\"token\"}' "
-                          << testsupport::S3rver::kAccessKey << " \"$secret\"\n";
-    chmod(script.c_str(), 0755);
-    auto r = RunProcess(RecorderArgs(ShortClip(), dir,
-                                     {"-readrate", "20", "-endpoint", server.Endpoint(),
-                                      "-credentialprocess", script, "-region", "us-east-1"}),
-                        120000);
-    const std::string log = ReadFile(dir + "/log.txt");
-    ASSERT_EQ(r.exitStatus, 0) << r.output << log;
-    EXPECT_EQ(log.find("wrong-secret"), std::string::npos);
-    EXPECT_EQ(log.find(testsupport::S3rver::kSecretKey), std::string::npos);
-
-    Notified status = ReadStatus(dir + "/status.jsonl");
-    ASSERT_GE(status.sequence.size(), 2u) << log;
-    EXPECT_GE(status.tokenRequests, 1u);  // after the wrong key was refused
-    const std::string asked = ReadFile(dir + "/count");
-    EXPECT_GE(std::count(asked.begin(), asked.end(), '\n'), 2);  // asked again after the refusal
-
-    auto listing = RunProcess(
-        {"env", "AWS_ACCESS_KEY_ID=AKIDTEST", "AWS_SECRET_ACCESS_KEY=secretTEST",
-         "AWS_DEFAULT_REGION=us-east-1", "AWS_EC2_METADATA_DISABLED=true",
-         "AWS_CONFIG_FILE=/dev/null", "AWS_SHARED_CREDENTIALS_FILE=/dev/null", "/usr/bin/aws",
-         "--endpoint-url", server.Endpoint(), "s3", "ls", "--recursive", "s3://rec/"},
-        120000);
-    ASSERT_EQ(listing.exitStatus, 0) << listing.output;
-    size_t objects = 0;
-    for (size_t at = 0; (at = listing.output.find(".ts", at)) != std::string::npos; ++at) ++objects;
-    EXPECT_EQ(objects, status.sequence.size()) << listing.output;
 }
 
 // A port on 127.0.0.1 that was free a moment ago (nothing listens on it afterwards).
@@ -405,43 +163,125 @@ int FreePort(int type) {
     close(fd);
     return ntohs(address.sin_port);
 }
-int FreeUdpPort() {
-    return FreePort(SOCK_DGRAM);
+
+// Records each clip into a local directory and checks the objects against the input's frames.
+// The upload interval must be longer than the clip's longest GOP, so that every object begins
+// with an IDR and decodes on its own (a longer GOP is split, and the object holding its rest
+// does not).
+TEST(EndToEndTest, StoredObjectsDecodeToTheInputsFrames) {
+    const struct {
+        std::string clip, codec, interval;
+        int gop;  // 0: IDRs at scene cuts, B-frames (3 at most)
+    } cases[] = {{Clip("e2e_h264.mp4", 5, kX264Gop30), "h264", "1", 30},
+                 {Clip("e2e_h264_bframes.ts", 6,
+                       "-c:v libx264 -preset veryfast -g 90 -keyint_min 15 -sc_threshold 40 -bf 3",
+                       ",negate=enable='lt(mod(t,3.7),1.3)'"),
+                  "h264", "4", 0},
+                 {Clip("e2e_h265.mp4", 5,
+                       "-c:v libx265 -preset ultrafast -x265-params "
+                       "keyint=30:min-keyint=30:scenecut=0:open-gop=0:bframes=0:log-level=error"),
+                  "h265", "1", 30}};
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.clip);
+        ASSERT_FALSE(c.clip.empty());
+        const std::string dir = Scratch("frames-" + c.codec + "-" + std::to_string(c.gop));
+        auto r = RunProcess(RecorderArgs(c.clip, dir,
+                                         {"-kct", c.codec, "-readrate", "10", "-uploadinterval",
+                                          c.interval, "-endpoint", Store(dir)}),
+                            120000);
+        const std::string log = ReadFile(dir + "/log.txt");
+        ASSERT_EQ(r.exitStatus, 0) << r.output << log;
+        EXPECT_EQ(log.find("queue overflow"), std::string::npos);
+        auto objects = Objects(dir + "/store/rec");
+        ASSERT_GE(objects.size(), 2u) << log;
+        Notified status = ReadStatus(dir + "/status.jsonl");
+        ASSERT_EQ(status.sequence.size(), objects.size());
+        for (size_t i = 0; i < status.sequence.size(); ++i)
+            EXPECT_EQ(status.sequence[i], static_cast<long>(i + 1));
+        EXPECT_EQ(status.uploadInfos, objects.size());
+
+        const auto input = FrameHashes(c.clip);
+        const auto stored = FrameHashes(Concatenate(objects, dir + "/all.ts"));
+        ASSERT_FALSE(stored.empty());
+        const size_t k = std::find(input.begin(), input.end(), stored.front()) - input.begin();
+        ASSERT_LT(k, input.size());
+        EXPECT_TRUE(c.gop == 0 || k % c.gop == 0) << "the first stored frame is not an IDR";
+        // The end of the file is drained: the stored frames run from there to the input's last.
+        ASSERT_EQ(k + stored.size(), input.size());
+        EXPECT_TRUE(std::equal(stored.begin(), stored.end(), input.begin() + k));
+        // Durations run on decode times: with B-frames the first IDR is decoded `reorder`
+        // frames before it is shown, and the audio runs on to the end of the last shown frame.
+        const double frameMs = 1000.0 / 30;
+        const int reorder = c.gop > 0 ? 0 : 2;
+        long reported = 0;
+        for (long d : status.durations) reported += d;
+        EXPECT_NEAR(static_cast<double>(reported), (input.size() - k) * frameMs,
+                    (1 + reorder) * frameMs + 1)
+            << "frames " << k << ".." << input.size();
+        for (const auto& object : objects) {
+            auto decode = RunProcess(Words("ffmpeg -v error -i") + Args{object, "-f", "null", "-"});
+            EXPECT_TRUE(decode.output.empty()) << object << ": " << decode.output;
+        }
+    }
 }
-int FreeTcpPort() {
-    return FreePort(SOCK_STREAM);
+
+TEST(EndToEndTest, ToS3rverWithCredentialsFromACredentialProcess) {
+    using testsupport::S3rver;
+    S3rver server;
+    ASSERT_TRUE(server.Start(std::string(SFR_SOURCE_DIR) + "/scripts/s3rver.sh", BuildPath("node")))
+        << server.Error();
+    const std::string dir = Scratch("s3");
+    // The first answer carries a wrong secret; every later one the right key pair.
+    const std::string script = dir + "/credentials.sh";
+    std::ofstream(script) << "#!/bin/sh\ncount=" << dir << "/count\necho x >> \"$count\"\n"
+                          << "secret=" << S3rver::kSecretKey << "\n"
+                          << "[ \"$(wc -l < \"$count\")\" -eq 1 ] && secret=wrong-secret\n"
+                          << "printf '{\"Version\":1,\"AccessKeyId\":\"%s\",\"SecretAccessKey\":"
+                             "\"%s\",\"SessionToken\":\"token\"}' "
+                          << S3rver::kAccessKey << " \"$secret\"\n";
+    chmod(script.c_str(), 0755);
+    auto r = RunProcess(RecorderArgs(ShortClip(), dir,
+                                     {"-readrate", "20", "-endpoint", server.Endpoint(),
+                                      "-credentialprocess", script, "-region", "us-east-1"}),
+                        120000);
+    const std::string log = ReadFile(dir + "/log.txt");
+    ASSERT_EQ(r.exitStatus, 0) << r.output << log;
+    EXPECT_EQ(log.find("wrong-secret"), std::string::npos);
+    EXPECT_EQ(log.find(S3rver::kSecretKey), std::string::npos);
+
+    Notified status = ReadStatus(dir + "/status.jsonl");
+    ASSERT_GE(status.sequence.size(), 2u) << log;
+    EXPECT_GE(status.tokenRequests, 1u);  // after the wrong key was refused
+    const std::string asked = ReadFile(dir + "/count");
+    EXPECT_GE(std::count(asked.begin(), asked.end(), '\n'), 2);  // asked again after the refusal
+
+    auto listing = RunProcess(
+        Words("env AWS_ACCESS_KEY_ID=AKIDTEST AWS_SECRET_ACCESS_KEY=secretTEST "
+              "AWS_DEFAULT_REGION=us-east-1 AWS_EC2_METADATA_DISABLED=true "
+              "AWS_CONFIG_FILE=/dev/null AWS_SHARED_CREDENTIALS_FILE=/dev/null /usr/bin/aws "
+              "--endpoint-url") +
+            Args{server.Endpoint()} + Words("s3 ls --recursive s3://rec/"),
+        120000);
+    ASSERT_EQ(listing.exitStatus, 0) << listing.output;
+    size_t objects = 0;
+    for (size_t at = 0; (at = listing.output.find(".ts", at)) != std::string::npos; ++at) ++objects;
+    EXPECT_EQ(objects, status.sequence.size()) << listing.output;
 }
 
 TEST(EndToEndTest, LiveUdpInputThatStopsAndStartsAgainIsRecordedAcrossTheGap) {
     const std::string clip = ShortClip();
     const std::string dir = Scratch("udp");
-    fs::create_directories(dir + "/store/rec");
-    const std::string url = "udp://127.0.0.1:" + std::to_string(FreeUdpPort());
-    const std::vector<std::string> sender = {"ffmpeg",
-                                             "-v",
-                                             "error",
-                                             "-re",
-                                             "-i",
-                                             clip,
-                                             "-c",
-                                             "copy",
-                                             "-f",
-                                             "mpegts",
-                                             url + "?pkt_size=1316"};
+    const std::string url = "udp://127.0.0.1:" + std::to_string(FreePort(SOCK_DGRAM));
     // Ends by itself 6 s of input in: 4 s of the first sending and 2 s of the second.
-    Child recorder(
-        RecorderArgs(url, dir, {"-duration", "6", "-endpoint", "file://" + dir + "/store"}),
-        dir + "/output.txt");
-    {
-        Child first(sender);
-        EXPECT_EQ(first.Wait(60000), 0);
-    }
+    Child recorder(RecorderArgs(url, dir, {"-duration", "6", "-endpoint", Store(dir)}),
+                   dir + "/output.txt");
+    EXPECT_EQ(Child(Sender(clip, url)).Wait(60000), 0);
     // After 10 s of silence the recorder gives the input up and reopens it.
     ASSERT_TRUE(testsupport::WaitUntil(
         [&] { return ReadFile(dir + "/log.txt").find("reopening in") != std::string::npos; },
         60000))
         << ReadFile(dir + "/log.txt");
-    Child second(sender);
+    Child second(Sender(clip, url));
     ASSERT_EQ(recorder.Wait(90000), 0) << ReadFile(dir + "/log.txt");
     const std::string log = ReadFile(dir + "/log.txt");
     EXPECT_NE(log.find("reopened"), std::string::npos);
@@ -449,13 +289,12 @@ TEST(EndToEndTest, LiveUdpInputThatStopsAndStartsAgainIsRecordedAcrossTheGap) {
 
     auto objects = Objects(dir + "/store/rec");
     ASSERT_FALSE(objects.empty()) << log;
-    const std::string all = Concatenate(objects, dir + "/all.ts");
-    auto probe = RunProcess({"ffprobe", "-v", "error", "-select_streams", "v:0", "-show_entries",
-                             "packet=dts_time", "-of", "csv=p=0", all});
-    std::istringstream lines(probe.output);
     std::vector<double> dts;
-    for (std::string line; std::getline(lines, line);)
-        if (!line.empty()) dts.push_back(std::atof(line.c_str()));
+    for (const auto& line :
+         OutputLines(Words("ffprobe -v error -select_streams v:0 -show_entries packet=dts_time "
+                           "-of csv=p=0") +
+                     Args{Concatenate(objects, dir + "/all.ts")}))
+        dts.push_back(std::atof(line.c_str()));
     ASSERT_GT(dts.size(), 60u);
     for (size_t i = 1; i < dts.size(); ++i) {
         EXPECT_GT(dts[i], dts[i - 1]) << i;
@@ -470,16 +309,10 @@ TEST(EndToEndTest, LiveUdpInputThatStopsAndStartsAgainIsRecordedAcrossTheGap) {
 TEST(EndToEndTest, LiveInputWhoseSenderStopsKeepsItsTailOnSigterm) {
     const std::string clip = ShortClip();
     const std::string dir = Scratch("udp-tail");
-    fs::create_directories(dir + "/store/rec");
-    const std::string url = "udp://127.0.0.1:" + std::to_string(FreeUdpPort());
-    Child recorder(
-        RecorderArgs(url, dir, {"-uploadinterval", "2", "-endpoint", "file://" + dir + "/store"}),
-        dir + "/output.txt");
-    {
-        Child sender({"ffmpeg", "-v", "error", "-re", "-i", clip, "-c", "copy", "-f", "mpegts",
-                      url + "?pkt_size=1316"});
-        EXPECT_EQ(sender.Wait(60000), 0);
-    }
+    const std::string url = "udp://127.0.0.1:" + std::to_string(FreePort(SOCK_DGRAM));
+    Child recorder(RecorderArgs(url, dir, {"-uploadinterval", "2", "-endpoint", Store(dir)}),
+                   dir + "/output.txt");
+    EXPECT_EQ(Child(Sender(clip, url)).Wait(60000), 0);
     recorder.Signal(SIGTERM);
     ASSERT_EQ(recorder.Wait(60000), 0) << ReadFile(dir + "/log.txt");
     const std::string log = ReadFile(dir + "/log.txt");
@@ -500,17 +333,17 @@ TEST(EndToEndTest, LiveInputWhoseSenderStopsKeepsItsTailOnSigterm) {
 TEST(EndToEndTest, DrainAgainstAStoreThatIsDownEndsAtTheDrainTimeout) {
     const std::string dir = Scratch("drain-down");
     // Nothing listens on the endpoint: every transfer is a network error, waited out.
-    auto args = RecorderArgs(ShortClip(), dir,
-                             {"-readrate", "20", "-draintimeout", "2", "-endpoint",
-                              "http://127.0.0.1:" + std::to_string(FreeTcpPort())});
-    args.insert(args.begin(), {"env", "AWS_ACCESS_KEY_ID=AKID", "AWS_SECRET_ACCESS_KEY=secret",
-                               "AWS_SESSION_TOKEN=token"});
     auto start = std::chrono::steady_clock::now();
-    auto r = RunProcess(args, 60000);
-    auto took = std::chrono::steady_clock::now() - start;
+    auto r =
+        RunProcess(Words("env AWS_ACCESS_KEY_ID=AKID AWS_SECRET_ACCESS_KEY=secret "
+                         "AWS_SESSION_TOKEN=token") +
+                       RecorderArgs(ShortClip(), dir,
+                                    {"-readrate", "20", "-draintimeout", "2", "-endpoint",
+                                     "http://127.0.0.1:" + std::to_string(FreePort(SOCK_STREAM))}),
+                   60000);
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(20));
     const std::string log = ReadFile(dir + "/log.txt");
     EXPECT_EQ(r.exitStatus, 0) << log;
-    EXPECT_LT(took, std::chrono::seconds(20));
     std::smatch m;
     ASSERT_TRUE(
         std::regex_search(log, m,
@@ -524,12 +357,10 @@ TEST(EndToEndTest, DrainAgainstAStoreThatIsDownEndsAtTheDrainTimeout) {
 
 TEST(EndToEndTest, SigintEndsARunInOrderWithExitCodeZero) {
     const std::string dir = Scratch("sigint");
-    fs::create_directories(dir + "/store/rec");
-    Child recorder(RecorderArgs(ShortClip(), dir,
-                                {"-readrate", "0.5", "-endpoint", "file://" + dir + "/store"}),
+    Child recorder(RecorderArgs(ShortClip(), dir, {"-readrate", "0.5", "-endpoint", Store(dir)}),
                    dir + "/output.txt");
     ASSERT_TRUE(testsupport::WaitUntil(
-        [&] { return ReadStatus(dir + "/status.jsonl").sequence.size() >= 1; }, 60000))
+        [&] { return !ReadStatus(dir + "/status.jsonl").sequence.empty(); }, 60000))
         << ReadFile(dir + "/log.txt");
     recorder.Signal(SIGINT);
     ASSERT_EQ(recorder.Wait(60000), 0) << ReadFile(dir + "/log.txt");
@@ -546,13 +377,11 @@ TEST(EndToEndTest, SigintEndsARunInOrderWithExitCodeZero) {
 
 TEST(EndToEndTest, InputsThatCannotBeRecordedEndWithStatusOne) {
     const std::string dir = Scratch("bad");
-    const std::string audioOnly =
-        MediaClip("e2e_audio_only.m4a", {"-f", "lavfi", "-i", "sine=duration=1", "-c:a", "aac"});
-    struct Case {
-        std::string input;
-        std::string says;
+    const struct {
+        std::string input, says;
     } cases[] = {{dir + "/missing.mp4", "cannot open input \"" + dir + "/missing.mp4\""},
-                 {audioOnly, "has no H.264 or H.265 video"}};
+                 {MediaClip("e2e_audio_only.m4a", Words("-f lavfi -i sine=duration=1 -c:a aac")),
+                  "has no H.264 or H.265 video"}};
     for (const auto& c : cases) {
         auto r = RunProcess(RecorderArgs(c.input, dir, {"-endpoint", "file://" + dir}), 60000);
         EXPECT_EQ(r.exitStatus, 1);
@@ -565,24 +394,22 @@ TEST(EndToEndTest, InputsThatCannotBeRecordedEndWithStatusOne) {
 TEST(EndToEndTest, SourceClockJumpsNeverMakeAGarbageDuration) {
     const std::string clip = ShortClip();
     const std::string dir = Scratch("jumps");
-    fs::create_directories(dir + "/store/rec");
     // The same 4 s three times in one TS: the second two hours later, the third back at 0.
     const std::string later = MediaClip(
-        "e2e_short_2h.ts", {"-i", clip, "-c", "copy", "-output_ts_offset", "7200", "-f", "mpegts"});
+        "e2e_short_2h.ts", Args{"-i", clip} + Words("-c copy -output_ts_offset 7200 -f mpegts"));
     ASSERT_FALSE(later.empty());
-    const std::string jumpy = dir + "/jumpy.ts";
-    Concatenate({clip, later, clip}, jumpy);
-    auto r = RunProcess(
-        RecorderArgs(jumpy, dir, {"-readrate", "20", "-endpoint", "file://" + dir + "/store"}),
-        120000);
+    const std::string jumpy = Concatenate({clip, later, clip}, dir + "/jumpy.ts");
+    auto r =
+        RunProcess(RecorderArgs(jumpy, dir, {"-readrate", "20", "-endpoint", Store(dir)}), 120000);
     const std::string log = ReadFile(dir + "/log.txt");
     ASSERT_EQ(r.exitStatus, 0) << log;
     EXPECT_NE(log.find("jumped by"), std::string::npos);
     Notified status = ReadStatus(dir + "/status.jsonl");
     ASSERT_GE(status.sequence.size(), 6u) << log;
     for (long d : status.durations) EXPECT_LE(d, 2500) << log;
-    for (const auto& object : Objects(dir + "/store/rec")) EXPECT_LT(Duration(object), 2.5);
-    EXPECT_LT(Duration(Concatenate(Objects(dir + "/store/rec"), dir + "/all.ts")), 13.0);
+    const auto objects = Objects(dir + "/store/rec");
+    for (const auto& object : objects) EXPECT_LT(Duration(object), 2.5);
+    EXPECT_LT(Duration(Concatenate(objects, dir + "/all.ts")), 13.0);
 }
 
 }  // namespace

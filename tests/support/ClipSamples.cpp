@@ -11,7 +11,7 @@ extern "C" {
 #include <unistd.h>
 
 #include <algorithm>
-#include <cstdio>
+#include <optional>
 
 #include "platform/nal/StreamAnalyzer.h"
 #include "tests/support/TestSupport.h"
@@ -29,6 +29,20 @@ std::shared_ptr<const void> copyParameters(const AVCodecParameters* parameters) 
     });
 }
 
+using Packet = std::unique_ptr<AVPacket, void (*)(AVPacket*)>;
+Packet newPacket() {
+    return Packet(av_packet_alloc(), [](AVPacket* p) { av_packet_free(&p); });
+}
+
+// `path` opened with its stream information; null when it cannot be.
+std::shared_ptr<AVFormatContext> openInput(const std::string& path) {
+    AVFormatContext* context = nullptr;
+    if (avformat_open_input(&context, path.c_str(), nullptr, nullptr) < 0) return nullptr;
+    std::shared_ptr<AVFormatContext> input(context,
+                                           [](AVFormatContext* c) { avformat_close_input(&c); });
+    return avformat_find_stream_info(context, nullptr) < 0 ? nullptr : input;
+}
+
 // One track being read: its description, clock and running state.
 struct Reader {
     int streamIndex = -1;
@@ -42,26 +56,19 @@ struct Reader {
     int64_t lastCaptureMicros = 0;
 };
 
-struct Input {
-    AVFormatContext* context = nullptr;
-    AVPacket* packet = av_packet_alloc();
-    Reader readers[3];
-    ~Input() {
-        for (Reader& r : readers) av_bsf_free(&r.filter);
-        av_packet_free(&packet);
-        avformat_close_input(&context);
+struct Readers {
+    Reader all[3];  // video, audio, meta
+    ~Readers() {
+        for (Reader& r : all) av_bsf_free(&r.filter);
     }
 };
 
-void addSample(Reader& reader, AVPacket* owned, bool haveOrigin, int64_t originMicros,
-               uint64_t captureStartMicros) {
+void addSample(Reader& reader, Packet owned, int64_t originMicros, uint64_t captureStartMicros) {
     int64_t pts = owned->pts == AV_NOPTS_VALUE ? owned->dts : owned->pts;
     int64_t dts = owned->dts == AV_NOPTS_VALUE ? owned->pts : owned->dts;
     const AVRational clock{1, static_cast<int>(reader.clock)};
-    int64_t dtsMicros = av_rescale_q(dts, reader.timeBase, AVRational{1, 1000000});
-    int64_t sinceOrigin = haveOrigin ? dtsMicros - originMicros : 0;
-    if (sinceOrigin < 0) sinceOrigin = 0;
-
+    int64_t sinceOrigin = std::max<int64_t>(
+        av_rescale_q(dts, reader.timeBase, AVRational{1, 1000000}) - originMicros, 0);
     SampleAttributes a;
     a.rtpTime = static_cast<uint64_t>(av_rescale_q(pts, reader.timeBase, clock));
     a.attribute2 = static_cast<uint64_t>(av_rescale_q(dts, reader.timeBase, clock));
@@ -76,13 +83,9 @@ void addSample(Reader& reader, AVPacket* owned, bool haveOrigin, int64_t originM
     a.payloadSize = static_cast<uint64_t>(owned->size);
     const uint8_t* data = owned->data;
     size_t size = static_cast<size_t>(owned->size);
-    std::shared_ptr<const void> owner(owned, [](const void* p) {
-        auto* packet = static_cast<AVPacket*>(const_cast<void*>(p));
-        av_packet_free(&packet);
-    });
-    auto sample =
-        std::make_shared<ReceivedSample>(a.Encode(), data, size, owner, reader.description);
-    reader.samples->push_back(StreamData(sample));
+    std::shared_ptr<const void> owner(std::move(owned));
+    reader.samples->push_back(StreamData(
+        std::make_shared<ReceivedSample>(a.Encode(), data, size, owner, reader.description)));
 }
 
 }  // namespace
@@ -90,17 +93,15 @@ void addSample(Reader& reader, AVPacket* owned, bool haveOrigin, int64_t originM
 bool LoadClipSamples(const std::string& path, ClipSamples* clip, std::string* error,
                      uint64_t captureStartMicros) {
     *clip = ClipSamples();
-    Input input;
-    if (avformat_open_input(&input.context, path.c_str(), nullptr, nullptr) < 0 ||
-        avformat_find_stream_info(input.context, nullptr) < 0) {
+    auto input = openInput(path);
+    if (!input) {
         *error = "cannot open " + path;
         return false;
     }
-    Reader& video = input.readers[0];
-    Reader& audio = input.readers[1];
-    Reader& meta = input.readers[2];
-    for (unsigned i = 0; i < input.context->nb_streams; ++i) {
-        const AVStream* stream = input.context->streams[i];
+    Readers readers;
+    Reader &video = readers.all[0], &audio = readers.all[1], &meta = readers.all[2];
+    for (unsigned i = 0; i < input->nb_streams; ++i) {
+        const AVStream* stream = input->streams[i];
         const AVCodecParameters* par = stream->codecpar;
         Reader* reader = nullptr;
         auto kind = TrackDescription::Kind::Video;
@@ -146,41 +147,28 @@ bool LoadClipSamples(const std::string& path, ClipSamples* clip, std::string* er
     audio.samples = &clip->audio;
     meta.samples = &clip->meta;
 
-    bool haveOrigin = false;
-    int64_t originMicros = 0;
-    while (av_read_frame(input.context, input.packet) >= 0) {
-        AVPacket* packet = input.packet;
+    std::optional<int64_t> originMicros;
+    for (Packet packet = newPacket(); av_read_frame(input.get(), packet.get()) >= 0;
+         packet = newPacket()) {
         Reader* reader = nullptr;
-        for (Reader& r : input.readers)
+        for (Reader& r : readers.all)
             if (r.streamIndex == packet->stream_index) reader = &r;
-        if (!reader || (packet->pts == AV_NOPTS_VALUE && packet->dts == AV_NOPTS_VALUE)) {
-            av_packet_unref(packet);
-            continue;
-        }
-        if (!haveOrigin) {
+        if (!reader || (packet->pts == AV_NOPTS_VALUE && packet->dts == AV_NOPTS_VALUE)) continue;
+        if (!originMicros) {
             int64_t t = packet->dts != AV_NOPTS_VALUE ? packet->dts : packet->pts;
             originMicros = av_rescale_q(t, reader->timeBase, AVRational{1, 1000000});
-            haveOrigin = true;
         }
-        if (reader->filter) {
-            if (av_bsf_send_packet(reader->filter, packet) < 0) {
-                *error = "the Annex B filter refused a packet";
-                return false;
-            }
-            while (true) {
-                AVPacket* out = av_packet_alloc();
-                if (av_bsf_receive_packet(reader->filter, out) < 0) {
-                    av_packet_free(&out);
-                    break;
-                }
-                addSample(*reader, out, haveOrigin, originMicros, captureStartMicros);
-            }
-        } else {
-            AVPacket* owned = av_packet_alloc();
-            av_packet_move_ref(owned, packet);
-            addSample(*reader, owned, haveOrigin, originMicros, captureStartMicros);
+        if (!reader->filter) {
+            addSample(*reader, std::move(packet), *originMicros, captureStartMicros);
+            continue;
         }
-        av_packet_unref(packet);
+        if (av_bsf_send_packet(reader->filter, packet.get()) < 0) {
+            *error = "the Annex B filter refused a packet";
+            return false;
+        }
+        for (Packet out = newPacket(); av_bsf_receive_packet(reader->filter, out.get()) >= 0;
+             out = newPacket())
+            addSample(*reader, std::move(out), *originMicros, captureStartMicros);
     }
     clip->videoTrack = video.description;
     clip->audioTrack = audio.description;
@@ -245,12 +233,9 @@ std::string ClipWithId3(const std::string& source, const std::string& fileName, 
     if (stat(path.c_str(), &st) == 0 && st.st_size > 0) return path;
     std::string temporary = path + ".tmp" + std::to_string(getpid()) + ".ts";
 
-    AVFormatContext* in = nullptr;
-    if (avformat_open_input(&in, source.c_str(), nullptr, nullptr) < 0) return "";
-    if (avformat_find_stream_info(in, nullptr) < 0) {
-        avformat_close_input(&in);
-        return "";
-    }
+    auto input = openInput(source);
+    if (!input) return "";
+    AVFormatContext* in = input.get();
     AVFormatContext* out = nullptr;
     avformat_alloc_output_context2(&out, nullptr, "mpegts", temporary.c_str());
     bool ok = out != nullptr;
@@ -277,13 +262,13 @@ std::string ClipWithId3(const std::string& source, const std::string& fileName, 
     ok = ok && id3 && videoIndex >= 0 &&
          avio_open(&out->pb, temporary.c_str(), AVIO_FLAG_WRITE) >= 0 &&
          avformat_write_header(out, nullptr) >= 0;
-    AVPacket* packet = av_packet_alloc();
+    Packet packet = newPacket();
     int64_t nextTag90k = AV_NOPTS_VALUE;
     int tagNumber = 0;
-    while (ok && av_read_frame(in, packet) >= 0) {
+    while (ok && av_read_frame(in, packet.get()) >= 0) {
         int target = map[packet->stream_index];
         if (target < 0) {
-            av_packet_unref(packet);
+            av_packet_unref(packet.get());
             continue;
         }
         if (packet->stream_index == videoIndex && packet->dts != AV_NOPTS_VALUE) {
@@ -292,30 +277,26 @@ std::string ClipWithId3(const std::string& source, const std::string& fileName, 
             if (nextTag90k == AV_NOPTS_VALUE) nextTag90k = std::max<int64_t>(dts90k, 0);
             while (nextTag90k <= dts90k) {
                 std::string tag = id3Tag(tagNumber++);
-                AVPacket* tagPacket = av_packet_alloc();
-                av_new_packet(tagPacket, static_cast<int>(tag.size()));
+                Packet tagPacket = newPacket();
+                av_new_packet(tagPacket.get(), static_cast<int>(tag.size()));
                 std::copy(tag.begin(), tag.end(), tagPacket->data);
                 tagPacket->stream_index = id3->index;
-                tagPacket->pts = tagPacket->dts =
-                    av_rescale_q(nextTag90k, AVRational{1, 90000}, id3->time_base);
+                tagPacket->pts = tagPacket->dts = nextTag90k;  // the track's time base is 1/90000
                 tagPacket->flags = AV_PKT_FLAG_KEY;
-                ok = av_interleaved_write_frame(out, tagPacket) >= 0;
-                av_packet_free(&tagPacket);
+                ok = av_interleaved_write_frame(out, tagPacket.get()) >= 0;
                 nextTag90k += periodMs * 90;
             }
         }
-        av_packet_rescale_ts(packet, in->streams[packet->stream_index]->time_base,
+        av_packet_rescale_ts(packet.get(), in->streams[packet->stream_index]->time_base,
                              out->streams[target]->time_base);
         packet->stream_index = target;
         packet->pos = -1;
-        ok = ok && av_interleaved_write_frame(out, packet) >= 0;
-        av_packet_unref(packet);
+        ok = ok && av_interleaved_write_frame(out, packet.get()) >= 0;
+        av_packet_unref(packet.get());
     }
     ok = ok && av_write_trailer(out) >= 0;
-    av_packet_free(&packet);
     if (out) avio_closep(&out->pb);
     avformat_free_context(out);
-    avformat_close_input(&in);
     if (!ok) {
         unlink(temporary.c_str());
         return "";

@@ -67,39 +67,69 @@ std::shared_ptr<StreamData> MakeVideo(uint64_t timestamp, bool idr) {
     return MakeSample(timestamp, timestamp * 90, idr ? H264Idr() : H264NonIdr());
 }
 
-ProcessResult RunProcess(const std::vector<std::string>& argv, int timeoutMs) {
-    ProcessResult result;
-    char templ[] = "/tmp/sfr-run-XXXXXX";
-    int fd = mkstemp(templ);
-    if (fd < 0) return result;
-    pid_t pid = fork();
-    if (pid == 0) {
-        dup2(fd, 1);
-        dup2(fd, 2);
+ChildProcess::ChildProcess(const std::vector<std::string>& argv, const std::string& output) {
+    pid_ = fork();
+    if (pid_ == 0) {
+        int fd = open(output.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+        if (fd >= 0) {
+            dup2(fd, 1);
+            dup2(fd, 2);
+        }
         std::vector<char*> args;
         for (const auto& a : argv) args.push_back(const_cast<char*>(a.c_str()));
         args.push_back(nullptr);
         execvp(args[0], args.data());
         _exit(127);
     }
-    close(fd);
+    ended_ = pid_ < 0;
+}
+
+ChildProcess::~ChildProcess() {
+    if (ended_) return;
+    kill(pid_, SIGKILL);
+    waitpid(pid_, nullptr, 0);
+}
+
+void ChildProcess::Signal(int signo) {
+    if (!ended_) kill(pid_, signo);
+}
+
+int ChildProcess::Wait(int timeoutMs) {
     int status = 0;
-    auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
-    while (true) {
-        pid_t done = waitpid(pid, &status, WNOHANG);
-        if (done == pid) break;
-        if (std::chrono::steady_clock::now() > deadline) {
-            kill(pid, SIGKILL);
-            waitpid(pid, &status, 0);
-            break;
-        }
-        std::this_thread::sleep_for(std::chrono::milliseconds(5));
+    if (!ended_ && WaitUntil([&] { return waitpid(pid_, &status, WNOHANG) == pid_; }, timeoutMs)) {
+        ended_ = true;
+        if (WIFEXITED(status)) exitStatus_ = WEXITSTATUS(status);
+        if (WIFSIGNALED(status)) termSignal_ = WTERMSIG(status);
     }
-    if (WIFEXITED(status)) result.exitStatus = WEXITSTATUS(status);
-    if (WIFSIGNALED(status)) result.signal = WTERMSIG(status);
+    return exitStatus_;
+}
+
+ProcessResult RunProcess(const std::vector<std::string>& argv, int timeoutMs) {
+    ProcessResult result;
+    char templ[] = "/tmp/sfr-run-XXXXXX";
+    int fd = mkstemp(templ);
+    if (fd < 0) return result;
+    close(fd);
+    {
+        ChildProcess child(argv, templ);
+        child.Wait(timeoutMs);
+        if (!child.Ended()) {
+            child.Signal(SIGKILL);
+            child.Wait(60000);
+        }
+        result.exitStatus = child.Wait(0);
+        result.signal = child.TermSignal();
+    }
     result.output = ReadFile(templ);
     unlink(templ);
     return result;
+}
+
+std::vector<std::string> Words(const std::string& text) {
+    std::vector<std::string> words;
+    std::istringstream in(text);
+    for (std::string word; in >> word;) words.push_back(word);
+    return words;
 }
 
 std::string BuildPath(const std::string& relative) {

@@ -38,6 +38,31 @@ struct ProcessResult {
 // Runs argv[0] with the arguments (no shell), waits at most `timeoutMs`.
 ProcessResult RunProcess(const std::vector<std::string>& argv, int timeoutMs = 60000);
 
+// A child process (argv[0] with the arguments, no shell) that runs while the test goes on, its
+// stdout and stderr into `output` (truncated). Killed (SIGKILL) and reaped at destruction if it
+// still runs. Used from one thread.
+class ChildProcess {
+  public:
+    explicit ChildProcess(const std::vector<std::string>& argv,
+                          const std::string& output = "/dev/null");
+    ~ChildProcess();
+    void Signal(int signo);
+    // Waits at most `timeoutMs` for the end. Exit code; -1 when killed by a signal or still
+    // running.
+    int Wait(int timeoutMs);
+    bool Ended() const { return ended_; }
+    int TermSignal() const { return termSignal_; }  // 0 if it exited or still runs
+
+  private:
+    int pid_ = -1;
+    bool ended_ = false;
+    int exitStatus_ = -1;
+    int termSignal_ = 0;
+};
+
+// `text` split at spaces, for compact argument lists: Words("-c copy -f mpegts").
+std::vector<std::string> Words(const std::string& text);
+
 // Path of a file in the build tree (SFR_BINARY_DIR/relative).
 std::string BuildPath(const std::string& relative);
 
