@@ -12,6 +12,9 @@
 #include "tests/support/ScriptedTransfer.h"
 #include "tests/support/TestSupport.h"
 
+using testsupport::H264Idr;
+using testsupport::H264NonIdr;
+using testsupport::MakeReceived;
 using testsupport::ProcessHarness;
 using testsupport::RecorderArgs;
 using testsupport::ScriptedTransfer;
@@ -34,9 +37,16 @@ struct Pipeline {
         EXPECT_TRUE(h.Process().startProcess());
     }
     void Connect() { h.Host().ConnectionReply(); }
-    // Samples of `seconds` of stream from `fromMs`: 30 fps video with an IDR every
-    // `idrEveryMs`, 50 audio frames and one meta sample per second. Flushes the module's queues
-    // every few samples so that nothing is dropped for a full queue.
+    // Connects, hands over credentials and opens the start gate with a meta sample.
+    void Open(const LogCapture& log) {
+        Connect();
+        h.Host().SetProperties(kCredentials);
+        h.Host().Meta(MakeReceived(0, 0, "opens the gate"));
+        ASSERT_TRUE(WaitUntil([&] { return log.Contains("ST: start filing"); }));
+    }
+    // The stream from `fromMs` to `toMs`: 30 fps video with an IDR every `idrEveryMs`, 50 audio
+    // frames and one meta sample per second. Flushes the module's queues every few samples so
+    // that nothing is dropped for a full queue.
     void Stream(uint64_t fromMs, uint64_t toMs, uint64_t idrEveryMs) {
         const uint64_t framesPerIdr = idrEveryMs * 30 / 1000;
         uint64_t frame = (fromMs * 30 + 999) / 1000, audioFrame = (fromMs + 19) / 20;
@@ -46,21 +56,20 @@ struct Pipeline {
             if (videoMs >= toMs && audioMs >= toMs) break;
             if (videoMs <= audioMs && videoMs < toMs) {
                 bool idr = frame % framesPerIdr == 0;
-                h.Host().Video(testsupport::MakeReceived(
-                    videoMs, videoMs * 90,
-                    idr ? testsupport::H264Idr() : testsupport::H264NonIdr()));
+                h.Host().Video(MakeReceived(videoMs, videoMs * 90, idr ? H264Idr() : H264NonIdr()));
                 ++frame;
             } else {
-                h.Host().Audio(testsupport::MakeReceived(audioMs, audioMs * 48, "aac"));
-                if (audioMs % 1000 == 0) {
-                    h.Host().Meta(testsupport::MakeReceived(audioMs, audioMs * 90, "meta"));
-                }
+                h.Host().Audio(MakeReceived(audioMs, audioMs * 48, "aac"));
+                if (audioMs % 1000 == 0) h.Host().Meta(MakeReceived(audioMs, audioMs * 90, "m"));
                 ++audioFrame;
             }
             if (++sent % 16 == 0) h.Process().Module()->FlushQueues();
         }
         h.Process().Module()->FlushQueues();
     }
+
+    std::vector<FileTransferRequest> Requests() const { return transfer->Requests(); }
+    std::vector<LastSequenceNumNotify> Notifies() { return h.Host().SequenceNotifies(); }
 
     ProcessHarness h;
     std::shared_ptr<ScriptedTransfer> transfer;
@@ -71,83 +80,68 @@ bool isIdr(const StreamData& s) {
 }
 
 size_t countFrom(const LogCapture& log, const std::string& file, const std::string& message) {
-    size_t n = 0;
-    for (const auto& r : log.Records()) n += (r.file == file && r.message == message);
-    return n;
+    auto records = log.Records();
+    return std::count_if(records.begin(), records.end(), [&](const LogRecord& r) {
+        return r.file == file && r.message == message;
+    });
 }
 
 }  // namespace
 
-TEST(FileRecorderModuleGate, OpensAfterTheFirstSampleAndLogsInOrder) {
-    LogCapture log;
-    Pipeline p;
-    p.Connect();
-    p.h.Host().Meta(testsupport::MakeReceived(0, 0, "meta"));
-    ASSERT_TRUE(WaitUntil([&] { return log.Contains("ST: start filing"); }));
-    auto messages = log.Messages();
-    auto at = [&](const char* m) { return std::find(messages.begin(), messages.end(), m); };
-    EXPECT_LT(at("ST: wait for data receive"), at("ST: data receive event detected"));
-    EXPECT_LT(at("ST: data receive event detected"), at("ST: start filing"));
-    EXPECT_EQ(log.Find("ST: start filing")[0].priority, 11);
-    EXPECT_TRUE(log.Find("ST: start filing")[0].function.empty());
-}
-
-TEST(FileRecorderModuleGate, VideoAndAudioInTheIgnoreWindowAreDroppedMetaIsHeld) {
+TEST(FileRecorderModuleGate, OpensInOrderDroppingVideoAndAudioOfTheIgnoreWindowHoldingMeta) {
     LogCapture log;
     Pipeline p({"-startignoretime", "400", "-uploadinterval", "1"});
     p.h.Host().SetProperties(kCredentials);
     p.Connect();
     // During the window: an IDR, audio, and meta stamped after the later stream's first IDR.
-    p.h.Host().Video(testsupport::MakeReceived(0, 111, testsupport::H264Idr()));
-    p.h.Host().Audio(testsupport::MakeReceived(0, 0, "early-audio"));
-    p.h.Host().Meta(testsupport::MakeReceived(1500, 1500 * 90, "window-meta"));
+    p.h.Host().Video(MakeReceived(0, 111, H264Idr()));
+    p.h.Host().Audio(MakeReceived(0, 0, "early-audio"));
+    p.h.Host().Meta(MakeReceived(1500, 1500 * 90, "window-meta"));
     p.h.Process().Module()->FlushQueues();
     EXPECT_FALSE(log.Contains("ST: start filing"));
     ASSERT_TRUE(WaitUntil([&] { return log.Contains("ST: start filing"); }));
     EXPECT_FALSE(log.Contains("IDR: 111"));  // the window's video never reached the buffer
+    auto messages = log.Messages();
+    auto at = [&](const char* m) { return std::find(messages.begin(), messages.end(), m); };
+    EXPECT_LT(at("ST: wait for data receive"), at("ST: data receive event detected"));
+    EXPECT_LT(at("ST: data receive event detected"), at("ST: start filing"));
+    EXPECT_EQ(log.Find("ST: start filing")[0].priority, 11);
 
     p.Stream(1000, 3600, 1000);
     ASSERT_TRUE(WaitUntil([&] { return p.transfer->RequestCount() >= 1; }));
-    auto first = p.transfer->Requests()[0];
+    auto first = p.Requests()[0];
     ASSERT_FALSE(first.video.empty());
     EXPECT_EQ(first.video[0].timestamp, 1000u);
-    ASSERT_FALSE(first.meta.empty());
-    bool windowMetaKept = false;
-    for (const auto& m : first.meta) {
-        std::string text(reinterpret_cast<const char*>(m.PayloadData()), m.PayloadBytes());
-        windowMetaKept |= text == "window-meta";
-    }
-    EXPECT_TRUE(windowMetaKept);
+    EXPECT_TRUE(std::any_of(first.meta.begin(), first.meta.end(), [](const StreamData& m) {
+        return std::string(reinterpret_cast<const char*>(m.PayloadData()), m.PayloadBytes()) ==
+               "window-meta";
+    }));
     for (const auto& a : first.audio) EXPECT_GE(a.timestamp, 1000u);
 }
 
 TEST(FileRecorderModuleGate, DisconnectBeforeAnySampleOrDuringTheWindowEndsTheWaitAtOnce) {
-    {
+    for (bool inWindow : {false, true}) {
+        SCOPED_TRACE(inWindow ? "during the window" : "before any sample");
         LogCapture log;
-        Pipeline p;
+        Pipeline p(inWindow ? std::vector<std::string>{"-startignoretime", "600000"}
+                            : std::vector<std::string>{});
         p.Connect();
+        if (inWindow) {
+            p.h.Host().Meta(MakeReceived(0, 0, "m"));
+            ASSERT_TRUE(WaitUntil([&] { return log.Contains("ST: data receive event detected"); }));
+        }
+        auto start = std::chrono::steady_clock::now();
         p.h.Host().Disconnection();
+        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(5));
         EXPECT_TRUE(log.Contains("ST: stop event detected"));
         EXPECT_FALSE(log.Contains("ST: start filing"));
         size_t stops = log.Count("Stop enter.");
         p.h.Process().Module()->Disconnect();  // a second one changes nothing
         EXPECT_EQ(log.Count("Stop enter."), stops);
     }
-    {
-        LogCapture log;
-        Pipeline p({"-startignoretime", "600000"});
-        p.Connect();
-        p.h.Host().Meta(testsupport::MakeReceived(0, 0, "m"));
-        ASSERT_TRUE(WaitUntil([&] { return log.Contains("ST: data receive event detected"); }));
-        auto start = std::chrono::steady_clock::now();
-        p.h.Host().Disconnection();
-        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(5));
-        EXPECT_TRUE(log.Contains("ST: stop event detected"));
-        EXPECT_FALSE(log.Contains("ST: start filing"));
-    }
 }
 
-TEST(FileRecorderModuleWiring, ARepeatedConnectionReplyNeverReplacesRunningComponents) {
+TEST(FileRecorderModuleWiring, RepeatedConnectionReplyIsIgnoredTokenRequestHoldsTheStreamingId) {
     LogCapture log;
     Pipeline p;
     p.Connect();
@@ -156,6 +150,14 @@ TEST(FileRecorderModuleWiring, ARepeatedConnectionReplyNeverReplacesRunningCompo
     EXPECT_EQ(countFrom(log, "src/StreamBuffer", "Start enter."), 1u);
     EXPECT_TRUE(log.Contains("connection reply while connected: ignored."));
     EXPECT_NE(p.h.Process().GetProcessStatus(), Error);
+
+    // A token request carries only the streaming id.
+    GetAWSSecureTokenRequest request;
+    p.h.Process().notifyGetAWSTokenRequest(request);
+    auto sent = p.h.Host().TokenRequests();
+    ASSERT_EQ(sent.size(), 1u);
+    EXPECT_EQ(sent[0].streamingId, "cam1");
+    EXPECT_EQ(sent[0].requestId + sent[0].roleName + sent[0].sessionName + sent[0].base, "");
 }
 
 TEST(FileRecorderModuleWiring, CredentialsAreCheckedInByteOrderOfTheirKeys) {
@@ -173,62 +175,47 @@ TEST(FileRecorderModuleWiring, CredentialsAreCheckedInByteOrderOfTheirKeys) {
         {{{"awsAccessKey", "AK"}, {"awsSecretKey", "SK"}, {"region", "r"}}, "sessionToken"},
     };
     for (const auto& c : cases) {
+        SCOPED_TRACE(c.missing ? c.missing : "accepted");
         LogCapture log;
         Pipeline p;
         p.Connect();
         bool accepted = p.h.Host().SetProperties(c.properties);
         EXPECT_EQ(accepted, c.missing == nullptr);
-        size_t empties = 0;
-        for (const auto& m : log.Messages()) empties += m.find(" is empty") != std::string::npos;
-        if (c.missing != nullptr) {
-            EXPECT_EQ(empties, 1u);
-            EXPECT_TRUE(log.Contains(std::string(c.missing) + " is empty")) << c.missing;
-            EXPECT_TRUE(log.Contains("setProperties exit. not set property."));
-            EXPECT_FALSE(log.Contains("SetAwsInfo enter."));
-        } else {
-            EXPECT_EQ(empties, 0u);
-            EXPECT_TRUE(log.Contains("setAuth exit."));
-            EXPECT_TRUE(log.Contains("SetAwsInfo enter."));
-        }
+        auto messages = log.Messages();
+        EXPECT_EQ(std::count_if(messages.begin(), messages.end(),
+                                [](const std::string& m) { return m.find(" is empty") != m.npos; }),
+                  c.missing ? 1 : 0);
+        EXPECT_TRUE(!c.missing || log.Contains(std::string(c.missing) + " is empty"));
+        EXPECT_EQ(log.Contains("SetAwsInfo enter."), c.missing == nullptr);
     }
-}
-
-TEST(FileRecorderModuleWiring, TokenRequestCarriesOnlyTheStreamingId) {
-    Pipeline p;
-    GetAWSSecureTokenRequest request;
-    p.h.Process().notifyGetAWSTokenRequest(request);
-    auto sent = p.h.Host().TokenRequests();
-    ASSERT_EQ(sent.size(), 1u);
-    EXPECT_EQ(sent[0].streamingId, "cam1");
-    EXPECT_EQ(sent[0].requestId, "");
-    EXPECT_EQ(sent[0].roleName, "");
-    EXPECT_EQ(sent[0].sessionName, "");
-    EXPECT_EQ(sent[0].base, "");
 }
 
 TEST(FileRecorderModulePipeline, StreamBecomesNumberedFilesCutBeforeIdrs) {
     LogCapture log;
     // Room for the whole stream: it is fed faster than real time.
     Pipeline p({"-uploadinterval", "2", "-bufferfullsize", "10"});
-    p.Connect();
-    p.h.Host().SetProperties(kCredentials);
     p.transfer->SetInfo({4096, 12});
-    p.h.Host().Meta(testsupport::MakeReceived(0, 0, "opens the gate"));
-    ASSERT_TRUE(WaitUntil([&] { return log.Contains("ST: start filing"); }));
+    p.Open(log);
     p.Stream(0, 10000, 1000);
-    ASSERT_TRUE(WaitUntil([&] { return p.h.Host().SequenceNotifies().size() == 4; }, 20000));
+    ASSERT_TRUE(WaitUntil([&] { return p.Notifies().size() == 4; }, 20000));
 
-    auto requests = p.transfer->Requests();
+    auto requests = p.Requests();
+    auto notifies = p.Notifies();
+    auto statuses = p.h.Host().TransmissionStatuses();
     ASSERT_EQ(requests.size(), 4u);
+    ASSERT_EQ(statuses.size(), 4u);
     const uint32_t expectedDurations[] = {1999, 2000, 2000, 2000};
     for (size_t i = 0; i < requests.size(); ++i) {
+        SCOPED_TRACE(i);
         const auto& r = requests[i];
+        EXPECT_EQ(notifies[i].entries.at(0).sequenceNumber, i + 1);
+        EXPECT_TRUE(notifies[i].entries.at(0).succeeded);
+        EXPECT_EQ(statuses[i].statusMap["UploadInfo"].find(
+                      "FileIndex, " + std::to_string(i + 1) +
+                      ", ErrorCode, Success, ResponseTime, 12, FileSize, 4096, BufferCount, "),
+                  0u);
         EXPECT_EQ(r.sequenceNumber, static_cast<int64_t>(i + 1));
-        EXPECT_EQ(r.streamingId, "cam1");
         EXPECT_EQ(r.accessKey, "AK");
-        EXPECT_EQ(r.secretKey, "SK");
-        EXPECT_EQ(r.sessionToken, "TK");
-        EXPECT_EQ(r.region, "eu-west-1");
         EXPECT_EQ(r.duration, expectedDurations[i]);
         ASSERT_FALSE(r.video.empty());
         EXPECT_TRUE(isIdr(r.video[0]));
@@ -238,47 +225,30 @@ TEST(FileRecorderModulePipeline, StreamBecomesNumberedFilesCutBeforeIdrs) {
         EXPECT_GE(r.audio.back().timestamp, cut - 20);
         for (const auto& v : r.video) EXPECT_LT(v.timestamp, cut);
     }
-    auto notifies = p.h.Host().SequenceNotifies();
-    auto statuses = p.h.Host().TransmissionStatuses();
-    std::vector<std::string> infos;
-    for (const auto& s : statuses) {
-        auto it = s.statusMap.find("UploadInfo");
-        if (it != s.statusMap.end()) infos.push_back(it->second);
-    }
-    ASSERT_EQ(infos.size(), 4u);
-    for (size_t i = 0; i < 4; ++i) {
-        EXPECT_EQ(notifies[i].entries.at(0).sequenceNumber, i + 1);
-        EXPECT_TRUE(notifies[i].entries.at(0).succeeded);
-        EXPECT_EQ(
-            infos[i].find("FileIndex, " + std::to_string(i + 1) +
-                          ", ErrorCode, Success, ResponseTime, 12, FileSize, 4096, BufferCount, "),
-            0u)
-            << infos[i];
-    }
     EXPECT_FALSE(log.Contains("queue overflow (video)"));
 
     p.h.Host().Disconnection();
     p.h.Process().stopProcess();
-    EXPECT_TRUE(log.Contains("fileUpload exit."));
-    EXPECT_TRUE(log.Contains("createStreamFile exit."));
     EXPECT_EQ(p.transfer->RequestCount(), 4u);  // the held tail is dropped by a disconnection
 }
 
 TEST(FileRecorderModuleDrain, EndOfStreamStoresTheTailToTheLastSample) {
     LogCapture log;
     Pipeline p({"-uploadinterval", "2", "-bufferfullsize", "10"});
-    p.Connect();
-    p.h.Host().SetProperties(kCredentials);
-    p.h.Host().Meta(testsupport::MakeReceived(0, 0, "opens the gate"));
-    ASSERT_TRUE(WaitUntil([&] { return log.Contains("ST: start filing"); }));
+    p.Open(log);
+    auto start = std::chrono::steady_clock::now();
+    EXPECT_TRUE(p.h.Process().drainProcess(30000));  // nothing held: returns at once
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(2));
+    EXPECT_EQ(p.transfer->RequestCount(), 0u);
+
     p.Stream(0, 5000, 1000);
     EXPECT_TRUE(p.h.Process().drainProcess(20000));
     // Everything was reported when the drain returned.
-    auto requests = p.transfer->Requests();
+    auto requests = p.Requests();
+    auto notifies = p.Notifies();
     ASSERT_EQ(requests.size(), 3u);
-    EXPECT_EQ(p.h.Host().SequenceNotifies().size(), 3u);
+    ASSERT_EQ(notifies.size(), 3u);
     const auto& last = requests[2];
-    EXPECT_EQ(last.sequenceNumber, 3);
     EXPECT_TRUE(isIdr(last.video.front()));
     EXPECT_EQ(last.video.front().timestamp, 4000u);
     EXPECT_EQ(last.video.back().timestamp, 4966u);  // the input's last frame
@@ -286,77 +256,47 @@ TEST(FileRecorderModuleDrain, EndOfStreamStoresTheTailToTheLastSample) {
     uint32_t total = 0;
     for (const auto& r : requests) total += r.duration;
     EXPECT_EQ(total, 4981u);  // to the newest sample, inclusive
-    EXPECT_EQ(p.h.Host().SequenceNotifies()[2].entries[0].duration, last.duration);
-    EXPECT_TRUE(p.h.Host().SequenceNotifies()[2].entries[0].succeeded);
-    p.h.Host().Disconnection();
-}
-
-TEST(FileRecorderModuleDrain, NothingHeldReturnsAtOnce) {
-    Pipeline p;
-    p.Connect();
-    auto start = std::chrono::steady_clock::now();
-    EXPECT_TRUE(p.h.Process().drainProcess(30000));
-    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(2));
-    EXPECT_EQ(p.transfer->RequestCount(), 0u);
+    EXPECT_EQ(notifies[2].entries[0].duration, last.duration);
+    EXPECT_TRUE(notifies[2].entries[0].succeeded);
 }
 
 TEST(FileRecorderModuleDrain, AStoreThatIsDownEndsAtTheDeadlineNamingWhatIsDropped) {
     LogCapture log;
     Pipeline p({"-uploadinterval", "2", "-bufferfullsize", "10"});
     p.transfer->SetFallback(NetworkError);
-    p.Connect();
-    p.h.Host().SetProperties(kCredentials);
-    p.h.Host().Meta(testsupport::MakeReceived(0, 0, "opens the gate"));
-    ASSERT_TRUE(WaitUntil([&] { return log.Contains("ST: start filing"); }));
+    p.Open(log);
     p.Stream(0, 5000, 1000);
     auto start = std::chrono::steady_clock::now();
     EXPECT_FALSE(p.h.Process().drainProcess(800));
     auto took = std::chrono::steady_clock::now() - start;
     EXPECT_GE(took, std::chrono::milliseconds(700));
     EXPECT_LT(took, std::chrono::seconds(10));
-    bool named = false;
-    for (const auto& r : log.Records()) {
-        if (r.message.rfind("drain incomplete after 800 ms: 3 stream files (4981 ms of stream)",
-                            0) == 0) {
-            named = true;
-            EXPECT_EQ(r.priority, 5);
-        }
-    }
-    EXPECT_TRUE(named);
+    auto records = log.Records();
+    auto named = std::find_if(records.begin(), records.end(), [](const LogRecord& r) {
+        return r.message.rfind("drain incomplete after 800 ms: 3 stream files (4981 ms of stream)",
+                               0) == 0;
+    });
+    ASSERT_NE(named, records.end());
+    EXPECT_EQ(named->priority, 5);
     auto disconnectStart = std::chrono::steady_clock::now();
     p.h.Host().Disconnection();  // drops them, as a disconnection does
     EXPECT_LT(std::chrono::steady_clock::now() - disconnectStart, std::chrono::seconds(5));
-    EXPECT_TRUE(p.h.Host().SequenceNotifies().empty());
+    EXPECT_TRUE(p.Notifies().empty());
 }
 
-TEST(FileRecorderModuleConcurrency, DrainRacesDisconnectionAndModuleError) {
-    for (int round = 0; round < 5; ++round) {
+TEST(FileRecorderModuleConcurrency, ModuleErrorRacesDisconnectionAndDrain) {
+    for (int round = 0; round < 8; ++round) {
+        bool drain = round % 2 == 1;
         LogCapture log;
         Pipeline p({"-uploadinterval", "1", "-bufferfullsize", "10"});
-        p.Connect();
-        p.h.Host().SetProperties(kCredentials);
-        p.h.Host().Meta(testsupport::MakeReceived(0, 0, "opens the gate"));
-        ASSERT_TRUE(WaitUntil([&] { return log.Contains("ST: start filing"); }));
-        p.Stream(0, 1500, 500);
-        std::thread drain([&] { p.h.Process().drainProcess(5000); });
+        p.Open(log);
+        if (drain) p.Stream(0, 1500, 500);
+        std::thread drainer([&] {
+            if (drain) p.h.Process().drainProcess(5000);
+        });
         std::thread error([&] { p.h.Process().notifyModuleError(21); });
         std::thread disconnect([&] { p.h.Host().Disconnection(); });
-        drain.join();
-        error.join();
-        disconnect.join();
-        p.h.Process().stopProcess();
-    }
-}
-
-TEST(FileRecorderModuleConcurrency, ModuleErrorAndDisconnectionStopTheBufferTogether) {
-    for (int round = 0; round < 10; ++round) {
-        Pipeline p;
-        p.Connect();
-        p.h.Host().Meta(testsupport::MakeReceived(0, 0, "m"));
-        std::thread error([&] { p.h.Process().notifyModuleError(21); });
-        std::thread disconnect([&] { p.h.Host().Disconnection(); });
-        error.join();
-        disconnect.join();
+        for (auto* t : {&drainer, &error, &disconnect}) t->join();
         EXPECT_EQ(p.h.Process().GetProcessStatus(), Error);
         p.h.Process().stopProcess();
     }
@@ -368,25 +308,17 @@ TEST(FileRecorderModuleConcurrency, SamplesRaceTheGateAndTheDisconnection) {
         Pipeline p({"-uploadinterval", "1"});
         p.Connect();
         std::atomic<bool> go{true};
-        std::thread video([&] {
-            for (uint64_t t = 0; go; t += 33)
-                p.h.Host().Video(testsupport::MakeReceived(
-                    t, t * 90, t % 990 == 0 ? testsupport::H264Idr() : testsupport::H264NonIdr()));
-        });
-        std::thread audio([&] {
-            for (uint64_t t = 0; go; t += 20)
-                p.h.Host().Audio(testsupport::MakeReceived(t, t, "a"));
-        });
-        std::thread meta([&] {
-            for (uint64_t t = 0; go; t += 100)
-                p.h.Host().Meta(testsupport::MakeReceived(t, t, "m"));
-        });
+        std::vector<std::thread> senders;
+        for (auto send : {&TestHost::Video, &TestHost::Audio, &TestHost::Meta}) {
+            senders.emplace_back([&, send] {
+                for (uint64_t t = 0; go; t += 33)
+                    (p.h.Host().*send)(MakeReceived(t, t, t % 990 ? H264NonIdr() : H264Idr()));
+            });
+        }
         std::this_thread::sleep_for(std::chrono::milliseconds(100));
         p.h.Host().Disconnection();
         go = false;
-        video.join();
-        audio.join();
-        meta.join();
+        for (auto& t : senders) t.join();
         p.h.Process().stopProcess();
     }
     Logger::SetLevel(Logger::kDefaultLevel);

@@ -33,22 +33,24 @@ std::vector<std::string> accessUnits(const std::string& path) {
     return units;
 }
 
-std::vector<std::string> h264Units() {
-    static std::vector<std::string> units = accessUnits(testsupport::MediaClip(
-        "analyzer.h264", {"-f", "lavfi", "-i", "testsrc2=size=128x96:rate=10:duration=1", "-c:v",
-                          "libx264", "-preset", "ultrafast", "-g", "5", "-keyint_min", "5",
-                          "-sc_threshold", "0", "-bf", "0", "-f", "h264"}));
-    return units;
+// One second of 10 fps test picture with a key frame every fifth picture, no B frames.
+std::vector<std::string> encoded(const char* file, std::vector<std::string> codecArgs) {
+    std::vector<std::string> args = {"-f", "lavfi", "-i",
+                                     "testsrc2=size=128x96:rate=10:duration=1"};
+    args.insert(args.end(), codecArgs.begin(), codecArgs.end());
+    return accessUnits(testsupport::MediaClip(file, args));
 }
-
+std::vector<std::string> h264Units() {
+    return encoded("analyzer.h264",
+                   {"-c:v", "libx264", "-preset", "ultrafast", "-g", "5", "-keyint_min", "5",
+                    "-sc_threshold", "0", "-bf", "0", "-f", "h264"});
+}
 std::vector<std::string> h265Units(bool openGop) {
-    std::string params =
-        std::string("keyint=5:min-keyint=5:scenecut=0:bframes=0:log-level=error:") +
-        (openGop ? "open-gop=1" : "open-gop=0");
-    return accessUnits(
-        testsupport::MediaClip(openGop ? "analyzer-cra.hevc" : "analyzer-idr.hevc",
-                               {"-f", "lavfi", "-i", "testsrc2=size=128x96:rate=10:duration=1",
-                                "-c:v", "libx265", "-x265-params", params, "-f", "hevc"}));
+    return encoded(openGop ? "analyzer-cra.hevc" : "analyzer-idr.hevc",
+                   {"-c:v", "libx265", "-x265-params",
+                    std::string("keyint=5:min-keyint=5:scenecut=0:bframes=0:log-level=error:") +
+                        (openGop ? "open-gop=1" : "open-gop=0"),
+                    "-f", "hevc"});
 }
 
 bool h264(const std::string& au) {
@@ -58,24 +60,17 @@ bool h265(const std::string& au) {
     return StreamAnalyzer::IsIdrH265(reinterpret_cast<const uint8_t*>(au.data()), au.size());
 }
 
-// Splits an Annex B unit at its start codes into NAL units.
+// Splits an Annex B unit at its start codes into NAL units (a NAL unit never ends in a zero
+// byte, so trailing zeros belong to the next four-byte start code).
 std::vector<std::string> nalUnits(const std::string& au) {
+    const std::string code("\0\0\1", 3);
     std::vector<std::string> nals;
-    size_t i = 0, start = std::string::npos;
-    while (i + 3 <= au.size()) {
-        if (au[i] == 0 && au[i + 1] == 0 && au[i + 2] == 1) {
-            if (start != std::string::npos) {
-                size_t end = i;
-                while (end > start && au[end - 1] == 0) --end;
-                nals.push_back(au.substr(start, end - start));
-            }
-            start = i + 3;
-            i += 3;
-        } else {
-            ++i;
-        }
+    for (size_t at = au.find(code); at != std::string::npos;) {
+        size_t next = au.find(code, at + 3);
+        nals.push_back(au.substr(at + 3, next == std::string::npos ? next : next - at - 3));
+        while (!nals.back().empty() && nals.back().back() == 0) nals.back().pop_back();
+        at = next;
     }
-    if (start != std::string::npos) nals.push_back(au.substr(start));
     return nals;
 }
 
@@ -88,11 +83,7 @@ std::string withStartCodes(const std::vector<std::string>& nals, size_t codeByte
 std::string lengthPrefixed(const std::vector<std::string>& nals) {
     std::string out;
     for (const auto& n : nals) {
-        uint32_t len = static_cast<uint32_t>(n.size());
-        out += static_cast<char>(len >> 24);
-        out += static_cast<char>(len >> 16);
-        out += static_cast<char>(len >> 8);
-        out += static_cast<char>(len);
+        for (int shift = 24; shift >= 0; shift -= 8) out += static_cast<char>(n.size() >> shift);
         out += n;
     }
     return out;
@@ -100,38 +91,28 @@ std::string lengthPrefixed(const std::vector<std::string>& nals) {
 
 }  // namespace
 
-TEST(StreamAnalyzerH264, RealStreamHasIdrEveryFifthAccessUnit) {
-    auto units = h264Units();
-    ASSERT_EQ(units.size(), 10u);
-    for (size_t i = 0; i < units.size(); ++i) EXPECT_EQ(h264(units[i]), i % 5 == 0) << "unit " << i;
-}
-
-TEST(StreamAnalyzerH264, FramingDoesNotChangeTheAnswer) {
-    auto units = h264Units();
-    ASSERT_GE(units.size(), 2u);
-    for (size_t i : {0u, 1u}) {
-        auto nals = nalUnits(units[i]);
-        bool idr = i == 0;
-        EXPECT_EQ(h264(withStartCodes(nals, 3)), idr);
-        EXPECT_EQ(h264(withStartCodes(nals, 4)), idr);
-        EXPECT_EQ(h264(lengthPrefixed(nals)), idr);
+// Real streams with a key frame every fifth access unit; every framing gives the same answer.
+TEST(StreamAnalyzerRealStreams, IdrEveryFifthUnitInAnyFraming) {
+    const std::pair<const char*, bool (*)(const std::string&)> codecs[] = {{"h264", h264},
+                                                                           {"h265", h265}};
+    for (const auto& [name, isIdr] : codecs) {
+        SCOPED_TRACE(name);
+        auto units = name == std::string("h264") ? h264Units() : h265Units(false);
+        ASSERT_EQ(units.size(), 10u);
+        for (size_t i = 0; i < units.size(); ++i) {
+            SCOPED_TRACE(i);
+            auto nals = nalUnits(units[i]);
+            EXPECT_EQ(isIdr(units[i]), i % 5 == 0);
+            EXPECT_EQ(isIdr(withStartCodes(nals, 3)), i % 5 == 0);
+            EXPECT_EQ(isIdr(withStartCodes(nals, 4)), i % 5 == 0);
+            EXPECT_EQ(isIdr(lengthPrefixed(nals)), i % 5 == 0);
+        }
     }
-}
-
-TEST(StreamAnalyzerH265, IdrIsRecognisedAndCraIsNot) {
-    auto idr = h265Units(false);
-    ASSERT_EQ(idr.size(), 10u);
-    for (size_t i = 0; i < idr.size(); ++i) EXPECT_EQ(h265(idr[i]), i % 5 == 0) << "unit " << i;
-
     auto cra = h265Units(true);
     ASSERT_EQ(cra.size(), 10u);
     EXPECT_TRUE(h265(cra[0]));   // the stream opens with an IDR
     EXPECT_FALSE(h265(cra[5]));  // a later key frame is a CRA picture
-    EXPECT_EQ(h265(lengthPrefixed(nalUnits(idr[0]))), true);
-    EXPECT_EQ(h265(withStartCodes(nalUnits(idr[0]), 3)), true);
-}
-
-TEST(StreamAnalyzerH265, H264RulesDoNotApplyToH265AndViceVersa) {
+    // One codec's rules never apply to the other.
     EXPECT_FALSE(h264(h265Units(false)[1]));
     EXPECT_FALSE(h265(h264Units()[1]));
 }
@@ -140,18 +121,15 @@ TEST(StreamAnalyzerBadInput, TruncatedOrRandomBytesGiveFalseWithoutOverread) {
     auto idr = h264Units()[0];
     // Every prefix of a real IDR unit, each in its own exactly-sized heap block so that ASan
     // sees any read past the end. Prefixes that still hold the slice header may say true.
-    auto nals = nalUnits(idr);
     size_t sliceStart = idr.find(std::string("\x00\x00\x01\x65", 4));
     ASSERT_NE(sliceStart, std::string::npos);
     for (size_t n = 0; n <= idr.size(); ++n) {
         std::vector<uint8_t> prefix(idr.begin(), idr.begin() + static_cast<long>(n));
         bool result = StreamAnalyzer::IsIdrH264(prefix.data(), prefix.size());
-        if (n <= sliceStart + 3) {
-            EXPECT_FALSE(result) << "prefix " << n;
-        }
+        EXPECT_TRUE(n > sliceStart + 3 || !result) << "prefix " << n;
         StreamAnalyzer::IsIdrH265(prefix.data(), prefix.size());
     }
-    auto lp = lengthPrefixed(nals);
+    auto lp = lengthPrefixed(nalUnits(idr));
     for (size_t n = 0; n < lp.size(); ++n) {
         std::vector<uint8_t> prefix(lp.begin(), lp.begin() + static_cast<long>(n));
         StreamAnalyzer::IsIdrH264(prefix.data(), prefix.size());
@@ -169,19 +147,14 @@ TEST(StreamAnalyzerBadInput, TruncatedOrRandomBytesGiveFalseWithoutOverread) {
     EXPECT_FALSE(h264(lying));
 }
 
-TEST(StreamAnalyzerOnSamples, ReadsThePayloadThroughTheSampleAndHandlesMarkers) {
+TEST(NalAnalyzerOnSamples, CodecTypeOneSelectsH265AnyOtherH264AndMarkersAreNoIdr) {
+    auto h264Idr = testsupport::MakeSample(0, 0, testsupport::H264Idr());
+    auto h265Idr = testsupport::MakeSample(0, 0, testsupport::H265Idr());
     StreamAnalyzer analyzer;
-    EXPECT_TRUE(analyzer.IsIDR(testsupport::MakeSample(0, 0, testsupport::H264Idr())));
     EXPECT_FALSE(analyzer.IsIDR(testsupport::MakeSample(0, 0, testsupport::H264NonIdr())));
-    EXPECT_TRUE(analyzer.IsIDR_H265(testsupport::MakeSample(0, 0, testsupport::H265Idr())));
     EXPECT_FALSE(analyzer.IsIDR_H265(testsupport::MakeSample(0, 0, testsupport::H265NonIdr())));
     EXPECT_FALSE(analyzer.IsIDR(std::make_shared<StreamData>()));
     EXPECT_FALSE(analyzer.IsIDR(nullptr));
-}
-
-TEST(NalAnalyzerCodecChoice, CodecTypeOneSelectsH265AnyOtherH264) {
-    auto h264Idr = testsupport::MakeSample(0, 0, testsupport::H264Idr());
-    auto h265Idr = testsupport::MakeSample(0, 0, testsupport::H265Idr());
     Orvane::NalAnalyzer hevc(1);
     EXPECT_TRUE(hevc.IsIDR(h265Idr));
     EXPECT_FALSE(hevc.IsIDR(h264Idr));

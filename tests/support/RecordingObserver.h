@@ -1,5 +1,6 @@
 // RecordingObserver: an INotifyObserver that keeps the process state like the framework does
-// and records every call. Thread-safe.
+// and records every call. Thread-safe: every member is guarded by mutex_, and the getters
+// return copies.
 #pragma once
 
 #include <functional>
@@ -16,26 +17,45 @@ class RecordingObserver : public Orvane::INotifyObserver {
   public:
     VqResult notifyGetAWSTokenRequest(GetAWSSecureTokenRequest& request) override;
     VqResult notifyLastSequenceNumNotify(LastSequenceNumNotify& message) override;
-    void notifyModuleError(unsigned int code) override;
-    void notifyModuleWarn(unsigned int code) override;
-    void notifyModuleExecute() override;
-    VqProcessState GetModuleStatus() override;
+    void notifyModuleError(unsigned int code) override { Note(errors_, Error, code); }
+    void notifyModuleWarn(unsigned int code) override { Note(warnings_, Warning, code); }
+    void notifyModuleExecute() override { Note(executes_, Executing, 0); }
+    VqProcessState GetModuleStatus() override { return State(); }
     void notifyTransmissionStatus(const std::map<std::string, std::string>& entries) override;
 
-    // Runs on every token request (e.g. to deliver credentials).
-    void OnTokenRequest(std::function<void()> action);
-
-    size_t TokenRequests() const;
-    std::vector<SequenceEntry> Entries() const;
-    std::vector<std::string> UploadInfos() const;  // the "UploadInfo" values in order
-    std::vector<unsigned> Warnings() const;
-    std::vector<unsigned> Errors() const;
-    size_t ExecuteCalls() const;
-    VqProcessState State() const;
-    unsigned Code() const;
+    // Runs on every token request, outside the lock (e.g. to deliver credentials).
+    void OnTokenRequest(std::function<void()> action) { Set(tokenAction_, std::move(action)); }
     void SetState(VqProcessState state, unsigned code);
 
+    size_t TokenRequests() const { return Get(tokenRequests_); }
+    std::vector<SequenceEntry> Entries() const { return Get(entries_); }
+    // The "UploadInfo" values, in order.
+    std::vector<std::string> UploadInfos() const { return Get(uploadInfos_); }
+    std::vector<unsigned> Warnings() const { return Get(warnings_); }
+    std::vector<unsigned> Errors() const { return Get(errors_); }
+    size_t ExecuteCalls() const { return Get(executes_).size(); }
+    VqProcessState State() const { return Get(state_); }
+    unsigned Code() const { return Get(code_); }
+
   private:
+    template <typename T>
+    T Get(const T& member) const {
+        std::lock_guard<std::mutex> lock(mutex_);
+        return member;
+    }
+    template <typename T>
+    void Set(T& member, T value) {
+        std::lock_guard<std::mutex> lock(mutex_);
+        member = std::move(value);
+    }
+    // Records a state notification in `calls` and takes on its state.
+    void Note(std::vector<unsigned>& calls, VqProcessState state, unsigned code) {
+        std::lock_guard<std::mutex> lock(mutex_);
+        calls.push_back(code);
+        state_ = state;
+        code_ = code;
+    }
+
     mutable std::mutex mutex_;
     std::function<void()> tokenAction_;
     size_t tokenRequests_ = 0;
@@ -43,7 +63,7 @@ class RecordingObserver : public Orvane::INotifyObserver {
     std::vector<std::string> uploadInfos_;
     std::vector<unsigned> warnings_;
     std::vector<unsigned> errors_;
-    size_t executeCalls_ = 0;
+    std::vector<unsigned> executes_;  // one 0 per notifyModuleExecute
     VqProcessState state_ = Executing;
     unsigned code_ = 0;
 };

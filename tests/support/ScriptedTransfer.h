@@ -3,7 +3,8 @@
 //
 // Results are taken from the script in order; when the script is empty, `fallback` is
 // returned. A transfer can be held (Hold) until Release or Cancel; Cancel makes the held
-// transfer and every later one return TimeOut, as the real stores do. Thread-safe.
+// transfer and every later one return TimeOut, as the real stores do. Thread-safe: every
+// member is guarded by mutex_; Transfer blocks only while held.
 #pragma once
 
 #include <condition_variable>
@@ -20,27 +21,44 @@ class ScriptedTransfer : public IFileTransfer {
   public:
     explicit ScriptedTransfer(FileTransferResult fallback = Success) : fallback_(fallback) {}
 
-    void Script(std::vector<FileTransferResult> results);
-    void SetFallback(FileTransferResult result);
+    void Script(std::vector<FileTransferResult> results) {
+        Set(script_, std::deque<FileTransferResult>(results.begin(), results.end()));
+    }
+    void SetFallback(FileTransferResult result) { Set(fallback_, result); }
     // What every transfer reports in its info.
-    void SetInfo(FileTransferInfo info);
+    void SetInfo(FileTransferInfo info) { Set(info_, info); }
     // The next transfers block until Release or Cancel.
-    void Hold();
+    void Hold() { Set(hold_, true); }
     void Release();
     // When false, Cancel is only recorded and a held transfer waits for Release (a transfer
     // that completes although a stop came meanwhile). Default true.
-    void SetCancelAborts(bool aborts);
+    void SetCancelAborts(bool aborts) { Set(cancelAborts_, aborts); }
 
     FileTransferResult Transfer(const FileTransferRequest& request,
                                 FileTransferInfo* info) override;
     void Cancel() override;
 
-    std::vector<FileTransferRequest> Requests() const;
-    size_t RequestCount() const;
-    bool Cancelled() const;
-    bool InTransfer() const;  // a transfer is blocked in Hold now
+    std::vector<FileTransferRequest> Requests() const { return Get(requests_); }
+    size_t RequestCount() const { return Requests().size(); }
+    bool Cancelled() const { return Get(cancelled_); }
+    bool InTransfer() const { return Get(inTransfer_); }  // a transfer is blocked in Hold now
 
   private:
+    template <typename T>
+    T Get(const T& member) const {
+        std::lock_guard<std::mutex> lock(mutex_);
+        return member;
+    }
+    // Sets a member and wakes a held transfer to look at it again.
+    template <typename T>
+    void Set(T& member, T value) {
+        {
+            std::lock_guard<std::mutex> lock(mutex_);
+            member = std::move(value);
+        }
+        changed_.notify_all();
+    }
+
     mutable std::mutex mutex_;
     std::condition_variable changed_;
     std::deque<FileTransferResult> script_;
