@@ -21,11 +21,12 @@ test: deps
 	@cmake --build build-asan -j $(JOBS)
 	@cd build-asan && ctest --output-on-failure -j $(JOBS) --timeout 600
 
-# The concurrency tests (suites whose name holds "Concurrency") under ThreadSanitizer.
+# Under ThreadSanitizer: the concurrency tests (suites whose name holds "Concurrency") and the
+# in-process pipeline (suites holding "Pipeline"), where every thread of the recorder runs.
 tsan: deps
 	@cmake -S . -B build-tsan $(CMAKE_GEN) -DCMAKE_BUILD_TYPE=Debug -DSFR_SANITIZE=thread >/dev/null
 	@cmake --build build-tsan -j $(JOBS)
-	@cd build-tsan && ctest --output-on-failure -j $(JOBS) --timeout 600 -R Concurrency
+	@cd build-tsan && ctest --output-on-failure -j $(JOBS) --timeout 600 -R 'Concurrency|Pipeline'
 
 bench: deps
 	@cmake -S . -B build-bench $(CMAKE_GEN) -DCMAKE_BUILD_TYPE=Release -DSFR_BENCH=ON >/dev/null
