@@ -4,6 +4,8 @@
 
 #include <cstdio>
 
+#include "platform/transfer/HttpText.h"
+
 namespace {
 
 struct UtcParts {
@@ -19,19 +21,8 @@ UtcParts split(uint64_t micros) {
     return parts;
 }
 
-std::string percentEncodeUnprintable(const std::string& text) {
-    static const char kHex[] = "0123456789ABCDEF";
-    std::string out;
-    for (unsigned char c : text) {
-        if (c >= 0x20 && c < 0x7f && c != '%') {
-            out.push_back(static_cast<char>(c));
-        } else {
-            out.push_back('%');
-            out.push_back(kHex[c >> 4]);
-            out.push_back(kHex[c & 15]);
-        }
-    }
-    return out;
+bool printableNotPercent(unsigned char c) {
+    return c >= 0x20 && c < 0x7f && c != '%';
 }
 
 }  // namespace
@@ -80,7 +71,7 @@ std::map<std::string, std::string> ObjectMetadata(const std::string& streamingId
                                                   int64_t sequenceNumber, uint32_t durationMs,
                                                   uint64_t captureMicros) {
     return {
-        {"streaming-id", percentEncodeUnprintable(streamingId)},
+        {"streaming-id", httptext::PercentEncode(streamingId, printableNotPercent)},
         {"sequence-number", std::to_string(sequenceNumber)},
         {"duration-ms", std::to_string(durationMs)},
         {"capture-time", IsoUtcTime(captureMicros)},

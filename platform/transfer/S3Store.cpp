@@ -11,6 +11,7 @@
 
 #include "platform/logger/Logger.h"
 #include "platform/transfer/Digest.h"
+#include "platform/transfer/HttpText.h"
 #include "platform/transfer/S3Response.h"
 #include "platform/transfer/S3Target.h"
 
@@ -20,32 +21,16 @@ const char kFile[] = "platform/transfer/S3Store";
 const size_t kMaxBodyKept = 64 * 1024;  // error documents are a few hundred bytes
 const int kMaxWaitMs = 1000;  // upper bound of one curl_multi_poll; curl's timers cut it shorter
 
-std::string Lower(std::string text) {
-    for (char& c : text) c = static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
-    return text;
-}
-
 // Header values must not carry line breaks (they would add headers of their own) and are
-// signed in canonical form: keep printable ASCII only, runs of spaces folded, no spaces at
-// the ends, so that every server's canonical form equals what was sent.
+// signed in canonical form, so they are sent in that form: every server then signs what was
+// sent.
 std::string HeaderValue(const std::string& value) {
-    std::string out;
-    bool pendingSpace = false;
-    for (unsigned char c : value) {
-        if (c == ' ' || c == '\t') {
-            pendingSpace = !out.empty();
-            continue;
-        }
-        if (pendingSpace) out.push_back(' ');
-        pendingSpace = false;
-        out.push_back(c >= 0x21 && c < 0x7f ? static_cast<char>(c) : '_');
-    }
-    return out;
+    return httptext::FoldSpaces(value, true);
 }
 
 // A metadata name as an HTTP token: lower case letters, digits, '-' and '_'.
 std::string MetadataName(const std::string& name) {
-    std::string out = Lower(name);
+    std::string out = httptext::Lower(name);
     for (char& c : out) {
         if (!std::isalnum(static_cast<unsigned char>(c)) && c != '-' && c != '_') c = '-';
     }
@@ -109,7 +94,7 @@ size_t KeepHeader(char* data, size_t size, size_t count, void* user) {
     }
     size_t colon = line.find(':');
     if (colon == std::string::npos) return n;
-    std::string name = Lower(line.substr(0, colon));
+    std::string name = httptext::Lower(line.substr(0, colon));
     size_t start = line.find_first_not_of(" \t", colon + 1);
     std::string value = start == std::string::npos ? "" : line.substr(start);
     if (name == "etag") response->etag = value;
@@ -161,7 +146,7 @@ bool S3StoreConfig::Parse(const std::string& endpointUrl, S3StoreConfig& out, st
         return true;
     }
     size_t schemeEnd = endpointUrl.find("://");
-    std::string scheme = Lower(endpointUrl.substr(0, schemeEnd));
+    std::string scheme = httptext::Lower(endpointUrl.substr(0, schemeEnd));
     if (schemeEnd == std::string::npos || (scheme != "http" && scheme != "https")) {
         why = "endpoint URL must start with http:// or https://";
         return false;
@@ -209,7 +194,7 @@ bool S3StoreConfig::Parse(const std::string& endpointUrl, S3StoreConfig& out, st
                 return false;
             }
         }
-        host = Lower(host);
+        host = httptext::Lower(host);
         for (unsigned char c : host) {
             if (!std::isalnum(c) && c != '.' && c != '-' && c != '_') {
                 why = "endpoint URL has an invalid host name";

@@ -6,6 +6,7 @@
 #include <cctype>
 
 #include "platform/transfer/Digest.h"
+#include "platform/transfer/HttpText.h"
 
 namespace {
 
@@ -13,52 +14,18 @@ bool Unreserved(unsigned char c) {
     return std::isalnum(c) || c == '-' || c == '_' || c == '.' || c == '~';
 }
 
-std::string Encode(const std::string& text, bool keepSlash) {
-    static const char kDigits[] = "0123456789ABCDEF";
-    std::string out;
-    out.reserve(text.size());
-    for (unsigned char c : text) {
-        if (Unreserved(c) || (keepSlash && c == '/')) {
-            out.push_back(static_cast<char>(c));
-        } else {
-            out.push_back('%');
-            out.push_back(kDigits[c >> 4]);
-            out.push_back(kDigits[c & 0x0f]);
-        }
-    }
-    return out;
-}
-
-std::string Lower(std::string text) {
-    for (char& c : text) c = static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
-    return text;
-}
-
-// Trims surrounding whitespace and folds inner runs of spaces into one, as SigV4 canonical
-// header values require.
-std::string CanonicalValue(const std::string& value) {
-    std::string out;
-    bool pendingSpace = false;
-    for (char c : value) {
-        if (c == ' ' || c == '\t') {
-            pendingSpace = !out.empty();
-            continue;
-        }
-        if (pendingSpace) out.push_back(' ');
-        pendingSpace = false;
-        out.push_back(c);
-    }
-    return out;
+bool UnreservedOrSlash(unsigned char c) {
+    return Unreserved(c) || c == '/';
 }
 
 }  // namespace
 
 std::string SigV4Signer::EncodePath(const std::string& path) {
-    return Encode(path, true);
+    return httptext::PercentEncode(path, UnreservedOrSlash);
 }
 
 std::string SigV4Signer::EncodeComponent(const std::string& text) {
-    return Encode(text, false);
+    return httptext::PercentEncode(text, Unreserved);
 }
 
 std::string SigV4Signer::CanonicalQuery(const std::string& query) {
@@ -102,7 +69,7 @@ SigV4Signature SigV4Signer::Sign(const SigV4Request& request, const SigV4Key& ke
     std::vector<std::pair<std::string, std::string>> headers;
     headers.reserve(request.headers.size());
     for (const auto& [name, value] : request.headers) {
-        headers.emplace_back(Lower(name), CanonicalValue(value));
+        headers.emplace_back(httptext::Lower(name), httptext::FoldSpaces(value, false));
     }
     std::sort(headers.begin(), headers.end());
 

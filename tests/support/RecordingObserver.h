@@ -10,10 +10,11 @@
 #include <vector>
 
 #include "src/INotifyObserver.h"
+#include "tests/support/Guarded.h"
 
 namespace testsupport {
 
-class RecordingObserver : public Orvane::INotifyObserver {
+class RecordingObserver : public Orvane::INotifyObserver, private Guarded {
   public:
     VqResult notifyGetAWSTokenRequest(GetAWSSecureTokenRequest& request) override;
     VqResult notifyLastSequenceNumNotify(LastSequenceNumNotify& message) override;
@@ -38,16 +39,6 @@ class RecordingObserver : public Orvane::INotifyObserver {
     unsigned Code() const { return Get(code_); }
 
   private:
-    template <typename T>
-    T Get(const T& member) const {
-        std::lock_guard<std::mutex> lock(mutex_);
-        return member;
-    }
-    template <typename T>
-    void Set(T& member, T value) {
-        std::lock_guard<std::mutex> lock(mutex_);
-        member = std::move(value);
-    }
     // Records a state notification in `calls` and takes on its state.
     void Note(std::vector<unsigned>& calls, VqProcessState state, unsigned code) {
         std::lock_guard<std::mutex> lock(mutex_);
@@ -56,7 +47,6 @@ class RecordingObserver : public Orvane::INotifyObserver {
         code_ = code;
     }
 
-    mutable std::mutex mutex_;
     std::function<void()> tokenAction_;
     size_t tokenRequests_ = 0;
     std::vector<SequenceEntry> entries_;

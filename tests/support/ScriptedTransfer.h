@@ -14,10 +14,11 @@
 #include <vector>
 
 #include "platform/transfer/FileTransfer.h"
+#include "tests/support/Guarded.h"
 
 namespace testsupport {
 
-class ScriptedTransfer : public IFileTransfer {
+class ScriptedTransfer : public IFileTransfer, private Guarded {
   public:
     explicit ScriptedTransfer(FileTransferResult fallback = Success) : fallback_(fallback) {}
 
@@ -44,22 +45,13 @@ class ScriptedTransfer : public IFileTransfer {
     bool InTransfer() const { return Get(inTransfer_); }  // a transfer is blocked in Hold now
 
   private:
-    template <typename T>
-    T Get(const T& member) const {
-        std::lock_guard<std::mutex> lock(mutex_);
-        return member;
-    }
     // Sets a member and wakes a held transfer to look at it again.
     template <typename T>
     void Set(T& member, T value) {
-        {
-            std::lock_guard<std::mutex> lock(mutex_);
-            member = std::move(value);
-        }
+        Guarded::Set(member, std::move(value));
         changed_.notify_all();
     }
 
-    mutable std::mutex mutex_;
     std::condition_variable changed_;
     std::deque<FileTransferResult> script_;
     FileTransferResult fallback_;
