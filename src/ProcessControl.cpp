@@ -20,31 +20,31 @@ ProcessControl::~ProcessControl() = default;
 
 bool ProcessControl::getArgument(ModuleSettings& settings) {
     constexpr const char* fn = "Orvane::ProcessControl::getArgument";
-    if (!GetArgument_str("bucketname", settings.bucketName, "")) {
+    if (!GetArgument_str("-bucketname", settings.bucketName, "")) {
         Logger::Put(4, kFile, fn, __LINE__, "get bucketName fail.");
         return false;
     }
-    if (!GetArgument_int("uploadinterval", settings.uploadInterval, 0, 10)) {
+    if (!GetArgument_int("-uploadinterval", settings.uploadInterval, 0, 10)) {
         Logger::Put(4, kFile, fn, __LINE__, "get uploadInterval fail.");
         return false;
     }
-    if (!GetArgument_int("authretrytime", settings.authRetryTime, 0, 10)) {
+    if (!GetArgument_int("-authretrytime", settings.authRetryTime, 0, 10)) {
         Logger::Put(4, kFile, fn, __LINE__, "get authRetryTime fail.");
         return false;
     }
-    if (!GetArgument_int("bufferfullsize", settings.bufferFullSize, 0, 10)) {
+    if (!GetArgument_int("-bufferfullsize", settings.bufferFullSize, 0, 10)) {
         Logger::Put(4, kFile, fn, __LINE__, "get bufferFUllSize fail.");
         return false;
     }
     std::string codec;
-    if (!GetArgument_str("kct", codec, "")) {
+    if (!GetArgument_str("-kct", codec, "")) {
         Logger::Put(4, kFile, fn, __LINE__, "get CodecType fail.");
         return false;
     }
     settings.codecType = codec.find("264") != std::string::npos ? 0 : 1;
 
     std::string accel;
-    if (GetArgument_str("s3accel", accel, "")) {
+    if (GetArgument_str("-s3accel", accel, "")) {
         std::transform(accel.begin(), accel.end(), accel.begin(),
                        [](unsigned char c) { return static_cast<char>(std::tolower(c)); });
         settings.s3Accel = accel == "true";
@@ -52,7 +52,7 @@ bool ProcessControl::getArgument(ModuleSettings& settings) {
         settings.s3Accel = false;
     }
 
-    if (!GetArgument_int("startignoretime", settings.startIgnoreTime, 0, 10)) {
+    if (!GetArgument_int("-startignoretime", settings.startIgnoreTime, 0, 10)) {
         settings.startIgnoreTime = 0;
     }
     Logger::Put(11, nullptr, nullptr, 0, "ST: start ignore time: %d [ms]",
