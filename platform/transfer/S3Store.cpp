@@ -5,36 +5,36 @@
 #include <cctype>
 #include <cstring>
 #include <mutex>
-#include <set>
 #include <utility>
 #include <vector>
 
 #include "platform/logger/Logger.h"
 #include "platform/transfer/Digest.h"
 #include "platform/transfer/HttpText.h"
+#include "platform/transfer/S3PutRequest.h"
 #include "platform/transfer/S3Response.h"
 #include "platform/transfer/S3Target.h"
+
+// What one HTTP exchange gave.
+struct S3Exchange {
+    bool cancelled = false;  // Cancel ended it
+    CURLMcode multiCode = CURLM_OK;
+    CURLcode transferCode = CURLE_OK;
+    std::string curlError;  // curl's text for a transferCode other than CURLE_OK
+    S3Response response;    // status, headers and body of the answer
+    uint32_t responseTimeMs = 0;
+};
 
 namespace {
 
 const char kFile[] = "platform/transfer/S3Store";
 const size_t kMaxBodyKept = 64 * 1024;  // error documents are a few hundred bytes
+const char kPut[] = "S3Store::Put";     // the function name of every line about a PUT
 const int kMaxWaitMs = 1000;  // upper bound of one curl_multi_poll; curl's timers cut it shorter
 
-// Header values must not carry line breaks (they would add headers of their own) and are
-// signed in canonical form, so they are sent in that form: every server then signs what was
-// sent.
-std::string HeaderValue(const std::string& value) {
+// A text from the answer (header or XML element), made printable for a log line.
+std::string Printable(const std::string& value) {
     return httptext::FoldSpaces(value, true);
-}
-
-// A metadata name as an HTTP token: lower case letters, digits, '-' and '_'.
-std::string MetadataName(const std::string& name) {
-    std::string out = httptext::Lower(name);
-    for (char& c : out) {
-        if (!std::isalnum(static_cast<unsigned char>(c)) && c != '-' && c != '_') c = '-';
-    }
-    return out;
 }
 
 // Replaces every occurrence of the secrets in a text that is about to be logged.
@@ -127,6 +127,67 @@ FileTransferResult ClassifyCurlError(CURLcode code) {
     }
 }
 
+// "[v6]:port" into "[v6]" and "port" (empty when absent).
+bool SplitIpv6Authority(const std::string& authority, std::string& host, std::string& port,
+                        std::string& why) {
+    why = "endpoint URL has a malformed IPv6 address";
+    size_t close = authority.find(']');
+    if (close == std::string::npos || close == 1) return false;
+    host = authority.substr(0, close + 1);
+    std::string after = authority.substr(close + 1);
+    if (!after.empty() && after[0] != ':') return false;
+    if (!after.empty()) port = after.substr(1);
+    for (char c : host.substr(1, host.size() - 2)) {
+        if (!std::isxdigit(static_cast<unsigned char>(c)) && c != ':' && c != '.') return false;
+    }
+    return true;
+}
+
+// "host[:port]" or "[v6][:port]" into the host (lower case) and the port text.
+bool SplitAuthority(const std::string& authority, std::string& host, std::string& port,
+                    std::string& why) {
+    if (!authority.empty() && authority[0] == '[') {
+        if (!SplitIpv6Authority(authority, host, port, why)) return false;
+    } else {
+        size_t colon = authority.find(':');
+        host = httptext::Lower(authority.substr(0, colon));
+        if (colon != std::string::npos) {
+            port = authority.substr(colon + 1);
+            if (port.empty()) {
+                why = "endpoint URL has an empty port";
+                return false;
+            }
+        }
+        for (unsigned char c : host) {
+            if (!std::isalnum(c) && c != '.' && c != '-' && c != '_') {
+                why = "endpoint URL has an invalid host name";
+                return false;
+            }
+        }
+    }
+    if (host.empty()) {
+        why = "endpoint URL has no host";
+        return false;
+    }
+    return true;
+}
+
+// A port text (empty: none) in its normal decimal form, 1 to 65535.
+bool NormalPort(std::string& port, std::string& why) {
+    if (port.empty()) return true;
+    long value = 0;
+    for (unsigned char c : port) {
+        if (!std::isdigit(c) || value > 65535) break;
+        value = value * 10 + (c - '0');
+    }
+    if (port.find_first_not_of("0123456789") != std::string::npos || value < 1 || value > 65535) {
+        why = "endpoint URL has an invalid port";
+        return false;
+    }
+    port = std::to_string(value);
+    return true;
+}
+
 struct CurlSlist {
     curl_slist* list = nullptr;
     ~CurlSlist() { curl_slist_free_all(list); }
@@ -137,6 +198,56 @@ struct CurlSlist {
         return true;
     }
 };
+
+// Options of one PUT: the URL, the body through ReadBody/SeekBody, the answer into `response`,
+// the store's timeouts.
+void SetUpEasy(CURL* easy, const std::string& url, const S3StoreConfig& config, curl_slist* headers,
+               Body& body, S3Response& response, char* errorBuffer) {
+    curl_easy_setopt(easy, CURLOPT_URL, url.c_str());
+    curl_easy_setopt(easy, CURLOPT_PROTOCOLS_STR, "http,https");
+    curl_easy_setopt(easy, CURLOPT_UPLOAD, 1L);
+    curl_easy_setopt(easy, CURLOPT_INFILESIZE_LARGE, static_cast<curl_off_t>(body.size));
+    curl_easy_setopt(easy, CURLOPT_READFUNCTION, ReadBody);
+    curl_easy_setopt(easy, CURLOPT_READDATA, &body);
+    curl_easy_setopt(easy, CURLOPT_SEEKFUNCTION, SeekBody);
+    curl_easy_setopt(easy, CURLOPT_SEEKDATA, &body);
+    curl_easy_setopt(easy, CURLOPT_HEADERFUNCTION, KeepHeader);
+    curl_easy_setopt(easy, CURLOPT_HEADERDATA, &response);
+    curl_easy_setopt(easy, CURLOPT_WRITEFUNCTION, KeepBody);
+    curl_easy_setopt(easy, CURLOPT_WRITEDATA, &response);
+    curl_easy_setopt(easy, CURLOPT_HTTPHEADER, headers);
+    curl_easy_setopt(easy, CURLOPT_ERRORBUFFER, errorBuffer);
+    curl_easy_setopt(easy, CURLOPT_NOSIGNAL, 1L);
+    curl_easy_setopt(easy, CURLOPT_CONNECTTIMEOUT_MS, config.connectTimeoutMs);
+    curl_easy_setopt(easy, CURLOPT_LOW_SPEED_LIMIT, config.lowSpeedLimit);
+    curl_easy_setopt(easy, CURLOPT_LOW_SPEED_TIME, config.lowSpeedTimeS);
+    curl_easy_setopt(easy, CURLOPT_TCP_KEEPALIVE, 1L);
+}
+
+// Drives `easy` on `multi` until it is done, the multi interface fails, or `cancelled` is set;
+// records which in `exchange`.
+void RunToCompletion(CURLM* multi, CURL* easy, const std::atomic<bool>& cancelled,
+                     S3Exchange& exchange) {
+    bool finished = false;
+    exchange.multiCode = curl_multi_add_handle(multi, easy);
+    while (exchange.multiCode == CURLM_OK && !finished) {
+        if (cancelled.load()) {
+            exchange.cancelled = true;
+            return;
+        }
+        int running = 0;
+        exchange.multiCode = curl_multi_perform(multi, &running);
+        int left = 0;
+        while (CURLMsg* message = curl_multi_info_read(multi, &left)) {
+            if (message->msg == CURLMSG_DONE && message->easy_handle == easy) {
+                exchange.transferCode = message->data.result;
+                finished = true;
+            }
+        }
+        if (finished || exchange.multiCode != CURLM_OK) return;
+        exchange.multiCode = curl_multi_poll(multi, nullptr, 0, kMaxWaitMs, nullptr);
+    }
+}
 
 }  // namespace
 
@@ -163,64 +274,8 @@ bool S3StoreConfig::Parse(const std::string& endpointUrl, S3StoreConfig& out, st
         why = "endpoint URL must not carry a user name";
         return false;
     }
-    std::string host = authority;
-    std::string port;
-    if (!authority.empty() && authority[0] == '[') {
-        size_t close = authority.find(']');
-        if (close == std::string::npos || close == 1) {
-            why = "endpoint URL has a malformed IPv6 address";
-            return false;
-        }
-        host = authority.substr(0, close + 1);
-        std::string after = authority.substr(close + 1);
-        if (!after.empty() && after[0] != ':') {
-            why = "endpoint URL has a malformed IPv6 address";
-            return false;
-        }
-        if (!after.empty()) port = after.substr(1);
-        for (char c : host.substr(1, host.size() - 2)) {
-            if (!std::isxdigit(static_cast<unsigned char>(c)) && c != ':' && c != '.') {
-                why = "endpoint URL has a malformed IPv6 address";
-                return false;
-            }
-        }
-    } else {
-        size_t colon = authority.find(':');
-        if (colon != std::string::npos) {
-            host = authority.substr(0, colon);
-            port = authority.substr(colon + 1);
-            if (port.empty()) {
-                why = "endpoint URL has an empty port";
-                return false;
-            }
-        }
-        host = httptext::Lower(host);
-        for (unsigned char c : host) {
-            if (!std::isalnum(c) && c != '.' && c != '-' && c != '_') {
-                why = "endpoint URL has an invalid host name";
-                return false;
-            }
-        }
-    }
-    if (host.empty()) {
-        why = "endpoint URL has no host";
-        return false;
-    }
-    if (!port.empty()) {
-        long value = 0;
-        for (unsigned char c : port) {
-            if (!std::isdigit(c) || value > 65535) {
-                why = "endpoint URL has an invalid port";
-                return false;
-            }
-            value = value * 10 + (c - '0');
-        }
-        if (value < 1 || value > 65535) {
-            why = "endpoint URL has an invalid port";
-            return false;
-        }
-        port = std::to_string(value);
-    }
+    std::string host, port;
+    if (!SplitAuthority(authority, host, port, why) || !NormalPort(port, why)) return false;
     out.endpoint = scheme + "://" + host + (port.empty() ? "" : ":" + port);
     return true;
 }
@@ -253,60 +308,56 @@ void S3Store::Cancel() {
 
 FileTransferResult S3Store::Put(const ObjectToStore& object, const StoreCredentials& credentials,
                                 FileTransferInfo* info) {
-    static const char kFunction[] = "S3Store::Put";
     FileTransferInfo local;
     if (info == nullptr) info = &local;
     info->fileSize = 0;
     info->responseTime = 0;
 
     if (cancelled_.load()) return TimeOut;
+    S3Target target;
+    const FileTransferResult refusal = checkSendable(object, credentials, target);
+    if (refusal != Success) return refusal;
+    const S3PutRequest request =
+        SignS3Put(target, object, credentials, SigV4Signer::AmzDate(signer_.Now()));
+    S3Exchange exchange;
+    if (!perform(target.url, request, object, exchange)) {
+        Logger::Put(4, kFile, kPut, __LINE__, "PUT %s/%s not sent: out of memory",
+                    object.bucket.c_str(), object.key.c_str());
+        return InternalError;
+    }
+    info->responseTime = exchange.responseTimeMs;
+    const std::vector<std::string> secrets = {credentials.secretKey, credentials.sessionToken,
+                                              request.signature};
+    const FileTransferResult result = interpret(exchange, object, request.md5Hex, secrets);
+    if (result == Success) info->fileSize = object.size;
+    return result;
+}
+
+FileTransferResult S3Store::checkSendable(const ObjectToStore& object,
+                                          const StoreCredentials& credentials, S3Target& target) {
     if (credentials.accessKey.empty() || credentials.secretKey.empty()) {
-        Logger::Put(5, kFile, kFunction, __LINE__, "PUT %s/%s not sent: no credentials",
+        Logger::Put(5, kFile, kPut, __LINE__, "PUT %s/%s not sent: no credentials",
                     object.bucket.c_str(), object.key.c_str());
         return AuthenticationError;
     }
     if (!endpointValid_ || multi_ == nullptr) {
-        Logger::Put(4, kFile, kFunction, __LINE__, "PUT %s/%s not sent: store not usable",
+        Logger::Put(4, kFile, kPut, __LINE__, "PUT %s/%s not sent: store not usable",
                     object.bucket.c_str(), object.key.c_str());
         return InternalError;
     }
-    S3Target target;
     std::string why;
     if (!S3TargetFor(endpoint_, object.bucket, object.key, credentials, target, why)) {
         // A region comes with the credentials, and new ones may bring a usable one.
         bool region = why.find("region") != std::string::npos;
-        Logger::Put(5, kFile, kFunction, __LINE__, "PUT \"%s/%s\" not sent: %s",
-                    object.bucket.c_str(), object.key.c_str(), why.c_str());
+        Logger::Put(5, kFile, kPut, __LINE__, "PUT \"%s/%s\" not sent: %s", object.bucket.c_str(),
+                    object.key.c_str(), why.c_str());
         return region ? AuthenticationError : FilePathError;
     }
+    return Success;
+}
 
-    // What it carries.
-    const digest::Md5 md5 = digest::Md5Of(object.data, object.size);
-    const std::string md5Hex = digest::Hex(md5);
-    SigV4Request request;
-    request.method = "PUT";
-    request.canonicalUri = target.canonicalUri;
-    request.payloadHash = digest::Hex(digest::Sha256Of(object.data, object.size));
-    const std::string amzDate = SigV4Signer::AmzDate(signer_.Now());
-    request.headers = {{"host", target.host},
-                       {"content-md5", digest::Base64(md5)},
-                       {"content-type", HeaderValue(object.contentType)},
-                       {"x-amz-content-sha256", request.payloadHash},
-                       {"x-amz-date", amzDate}};
-    if (!credentials.sessionToken.empty()) {
-        request.headers.emplace_back("x-amz-security-token", HeaderValue(credentials.sessionToken));
-    }
-    std::set<std::string> metadataNames;  // two names may fold into one; the first one wins
-    for (const auto& [name, value] : object.metadata) {
-        std::string header = "x-amz-meta-" + MetadataName(name);
-        if (name.empty() || !metadataNames.insert(header).second) continue;
-        request.headers.emplace_back(header, HeaderValue(value));
-    }
-    SigV4Key key{credentials.accessKey, credentials.secretKey, target.signingRegion, "s3"};
-    const SigV4Signature signature = SigV4Signer::Sign(request, key, amzDate);
-    const std::vector<std::string> secrets = {credentials.secretKey, credentials.sessionToken,
-                                              signature.signature};
-
+bool S3Store::perform(const std::string& url, const S3PutRequest& request,
+                      const ObjectToStore& object, S3Exchange& exchange) {
     CurlSlist headers;
     bool headersOk = headers.Add("Expect:");  // no 100-continue round trip
     for (const auto& [name, value] : request.headers) {
@@ -314,128 +365,95 @@ FileTransferResult S3Store::Put(const ObjectToStore& object, const StoreCredenti
         // empty one; the signature covers it either way.
         headersOk &= headers.Add(value.empty() ? name + ";" : name + ": " + value);
     }
-    headersOk &= headers.Add("Authorization: " + signature.authorization);
-
+    headersOk &= headers.Add("Authorization: " + request.authorization);
     CURL* easy = curl_easy_init();
     if (easy == nullptr || !headersOk) {
         if (easy != nullptr) curl_easy_cleanup(easy);
-        Logger::Put(4, kFile, kFunction, __LINE__, "PUT %s/%s not sent: out of memory",
-                    object.bucket.c_str(), object.key.c_str());
-        return InternalError;
+        return false;
     }
     Body body{object.data, object.size, 0};
-    S3Response response;
     char curlError[CURL_ERROR_SIZE] = {};
-    curl_easy_setopt(easy, CURLOPT_URL, target.url.c_str());
-    curl_easy_setopt(easy, CURLOPT_PROTOCOLS_STR, "http,https");
-    curl_easy_setopt(easy, CURLOPT_UPLOAD, 1L);
-    curl_easy_setopt(easy, CURLOPT_INFILESIZE_LARGE, static_cast<curl_off_t>(object.size));
-    curl_easy_setopt(easy, CURLOPT_READFUNCTION, ReadBody);
-    curl_easy_setopt(easy, CURLOPT_READDATA, &body);
-    curl_easy_setopt(easy, CURLOPT_SEEKFUNCTION, SeekBody);
-    curl_easy_setopt(easy, CURLOPT_SEEKDATA, &body);
-    curl_easy_setopt(easy, CURLOPT_HEADERFUNCTION, KeepHeader);
-    curl_easy_setopt(easy, CURLOPT_HEADERDATA, &response);
-    curl_easy_setopt(easy, CURLOPT_WRITEFUNCTION, KeepBody);
-    curl_easy_setopt(easy, CURLOPT_WRITEDATA, &response);
-    curl_easy_setopt(easy, CURLOPT_HTTPHEADER, headers.list);
-    curl_easy_setopt(easy, CURLOPT_ERRORBUFFER, curlError);
-    curl_easy_setopt(easy, CURLOPT_NOSIGNAL, 1L);
-    curl_easy_setopt(easy, CURLOPT_CONNECTTIMEOUT_MS, config_.connectTimeoutMs);
-    curl_easy_setopt(easy, CURLOPT_LOW_SPEED_LIMIT, config_.lowSpeedLimit);
-    curl_easy_setopt(easy, CURLOPT_LOW_SPEED_TIME, config_.lowSpeedTimeS);
-    curl_easy_setopt(easy, CURLOPT_TCP_KEEPALIVE, 1L);
+    SetUpEasy(easy, url, config_, headers.list, body, exchange.response, curlError);
 
-    // The exchange. curl_multi_poll sleeps until the socket, a curl timer (connect and
-    // low-speed timeouts) or Cancel's curl_multi_wakeup needs attention.
+    // curl_multi_poll sleeps until the socket, a curl timer (connect and low-speed timeouts) or
+    // Cancel's curl_multi_wakeup needs attention.
     CURLM* multi = static_cast<CURLM*>(multi_);
     const auto started = std::chrono::steady_clock::now();
-    bool finished = false;
-    bool cancelled = false;
-    CURLcode transferCode = CURLE_OK;
-    CURLMcode multiCode = curl_multi_add_handle(multi, easy);
-    while (multiCode == CURLM_OK && !finished) {
-        if (cancelled_.load()) {
-            cancelled = true;
-            break;
-        }
-        int running = 0;
-        multiCode = curl_multi_perform(multi, &running);
-        int left = 0;
-        while (CURLMsg* message = curl_multi_info_read(multi, &left)) {
-            if (message->msg == CURLMSG_DONE && message->easy_handle == easy) {
-                transferCode = message->data.result;
-                finished = true;
-            }
-        }
-        if (finished || multiCode != CURLM_OK) break;
-        multiCode = curl_multi_poll(multi, nullptr, 0, kMaxWaitMs, nullptr);
-    }
-    info->responseTime =
+    RunToCompletion(multi, easy, cancelled_, exchange);
+    exchange.responseTimeMs =
         static_cast<uint32_t>(std::chrono::duration_cast<std::chrono::milliseconds>(
                                   std::chrono::steady_clock::now() - started)
                                   .count());
     curl_multi_remove_handle(multi, easy);
-    long status = 0;
-    curl_easy_getinfo(easy, CURLINFO_RESPONSE_CODE, &status);
+    curl_easy_getinfo(easy, CURLINFO_RESPONSE_CODE, &exchange.response.status);
     curl_easy_cleanup(easy);
-    response.status = status;
+    if (exchange.transferCode != CURLE_OK)
+        exchange.curlError =
+            curlError[0] != '\0' ? curlError : curl_easy_strerror(exchange.transferCode);
+    return true;
+}
 
-    // What it means.
+FileTransferResult S3Store::interpret(const S3Exchange& exchange, const ObjectToStore& object,
+                                      const std::string& md5Hex,
+                                      const std::vector<std::string>& secrets) {
     const std::string where = object.bucket + "/" + object.key;
-    if (cancelled) {
-        Logger::Put(5, kFile, kFunction, __LINE__, "PUT %s cancelled after %u ms", where.c_str(),
-                    info->responseTime);
+    if (exchange.cancelled) {
+        Logger::Put(5, kFile, kPut, __LINE__, "PUT %s cancelled after %u ms", where.c_str(),
+                    exchange.responseTimeMs);
         return TimeOut;
     }
-    if (multiCode != CURLM_OK) {
-        Logger::Put(4, kFile, kFunction, __LINE__, "PUT %s: curl multi error %d", where.c_str(),
-                    static_cast<int>(multiCode));
+    if (exchange.multiCode != CURLM_OK) {
+        Logger::Put(4, kFile, kPut, __LINE__, "PUT %s: curl multi error %d", where.c_str(),
+                    static_cast<int>(exchange.multiCode));
         return InternalError;
     }
-    if (transferCode != CURLE_OK) {
-        FileTransferResult result = ClassifyCurlError(transferCode);
-        std::string text =
-            Redact(curlError[0] != '\0' ? curlError : curl_easy_strerror(transferCode), secrets);
-        Logger::Put(5, kFile, kFunction, __LINE__, "PUT %s failed after %u ms: %s (curl %d) -> %x",
-                    where.c_str(), info->responseTime, text.c_str(), static_cast<int>(transferCode),
-                    static_cast<unsigned>(result));
+    if (exchange.transferCode != CURLE_OK) {
+        FileTransferResult result = ClassifyCurlError(exchange.transferCode);
+        Logger::Put(5, kFile, kPut, __LINE__, "PUT %s failed after %u ms: %s (curl %d) -> %x",
+                    where.c_str(), exchange.responseTimeMs,
+                    Redact(exchange.curlError, secrets).c_str(),
+                    static_cast<int>(exchange.transferCode), static_cast<unsigned>(result));
         return result;
     }
-
+    const S3Response& response = exchange.response;
     const std::string code = response.XmlElement("Code");
-    FileTransferResult result = ClassifyS3Answer(status, code);
-    if (result == Success) {
-        // With SSE-KMS the ETag is not the MD5 of the body; S3 has checked Content-MD5 then.
-        bool kms = response.encryption.compare(0, 7, "aws:kms") == 0;
-        if (!kms && !EtagMatches(response.etag, md5Hex)) {
-            Logger::Put(5, kFile, kFunction, __LINE__, "PUT %s: ETag %s is not the body's MD5 %s",
-                        where.c_str(), HeaderValue(response.etag).c_str(), md5Hex.c_str());
-            return FileBroken;
-        }
-        info->fileSize = object.size;
-        Logger::Put(13, kFile, kFunction, __LINE__, "PUT %s: %zu bytes stored in %u ms",
-                    where.c_str(), object.size, info->responseTime);
-        return Success;
-    }
+    FileTransferResult result = ClassifyS3Answer(response.status, code);
+    if (result == Success) return checkStored(exchange, where, object.size, md5Hex);
 
-    std::string message = Redact(HeaderValue(response.XmlElement("Message")), secrets);
-    std::string requestId = HeaderValue(response.requestId);
+    std::string message = Redact(Printable(response.XmlElement("Message")), secrets);
+    std::string requestId = Printable(response.requestId);
     if (!requestId.empty()) requestId = " request id " + requestId;
-    Logger::Put(5, kFile, kFunction, __LINE__, "PUT %s: HTTP %ld %s \"%s\"%s -> %x", where.c_str(),
-                status, HeaderValue(code).c_str(), message.c_str(), requestId.c_str(),
+    Logger::Put(5, kFile, kPut, __LINE__, "PUT %s: HTTP %ld %s \"%s\"%s -> %x", where.c_str(),
+                response.status, Printable(code).c_str(), message.c_str(), requestId.c_str(),
                 static_cast<unsigned>(result));
-    if (result == RequestTimeTooSkewed) {
-        std::chrono::system_clock::time_point serverTime;
-        if (ParseServerTime(response.date, serverTime) ||
-            ParseServerTime(response.XmlElement("ServerTime"), serverTime)) {
-            signer_.CorrectClock(serverTime);
-            Logger::Put(5, kFile, kFunction, __LINE__,
-                        "signing clock set to the server's time (offset %lld s)",
-                        static_cast<long long>(signer_.ClockOffset().count()));
-        } else {
-            Logger::Put(5, kFile, kFunction, __LINE__, "server time unknown; clock not corrected");
-        }
-    }
+    if (result == RequestTimeTooSkewed) correctClock(response);
     return result;
+}
+
+FileTransferResult S3Store::checkStored(const S3Exchange& exchange, const std::string& where,
+                                        size_t size, const std::string& md5Hex) {
+    const S3Response& response = exchange.response;
+    // With SSE-KMS the ETag is not the MD5 of the body; S3 has checked Content-MD5 then.
+    bool kms = response.encryption.compare(0, 7, "aws:kms") == 0;
+    if (!kms && !EtagMatches(response.etag, md5Hex)) {
+        Logger::Put(5, kFile, kPut, __LINE__, "PUT %s: ETag %s is not the body's MD5 %s",
+                    where.c_str(), Printable(response.etag).c_str(), md5Hex.c_str());
+        return FileBroken;
+    }
+    Logger::Put(13, kFile, kPut, __LINE__, "PUT %s: %zu bytes stored in %u ms", where.c_str(), size,
+                exchange.responseTimeMs);
+    return Success;
+}
+
+void S3Store::correctClock(const S3Response& response) {
+    std::chrono::system_clock::time_point serverTime;
+    if (ParseServerTime(response.date, serverTime) ||
+        ParseServerTime(response.XmlElement("ServerTime"), serverTime)) {
+        signer_.CorrectClock(serverTime);
+        Logger::Put(5, kFile, kPut, __LINE__,
+                    "signing clock set to the server's time (offset %lld s)",
+                    static_cast<long long>(signer_.ClockOffset().count()));
+    } else {
+        Logger::Put(5, kFile, kPut, __LINE__, "server time unknown; clock not corrected");
+    }
 }

@@ -20,9 +20,15 @@
 #include <atomic>
 #include <chrono>
 #include <string>
+#include <vector>
 
 #include "platform/transfer/ObjectStore.h"
+#include "platform/transfer/S3PutRequest.h"
+#include "platform/transfer/S3Response.h"
+#include "platform/transfer/S3Target.h"
 #include "platform/transfer/SigV4Signer.h"
+
+struct S3Exchange;  // what one HTTP exchange gave (curl's codes, the answer); see S3Store.cpp
 
 struct S3StoreConfig {
     // "" for AWS: virtual-hosted https://BUCKET.s3.REGION.amazonaws.com/KEY, or
@@ -61,6 +67,23 @@ class S3Store : public IObjectStore {
     std::chrono::seconds ClockOffset() const { return signer_.ClockOffset(); }
 
   private:
+    // The steps of one Put, in order. Each logs its own failure lines.
+    // Success, or the result of a PUT that cannot be sent (no credentials, no usable target).
+    FileTransferResult checkSendable(const ObjectToStore& object,
+                                     const StoreCredentials& credentials, S3Target& target);
+    // Sends the request and reads the answer; false when curl cannot even be set up.
+    bool perform(const std::string& url, const S3PutRequest& request, const ObjectToStore& object,
+                 S3Exchange& exchange);
+    // The result of the exchange; `secrets` are kept out of the lines it logs.
+    FileTransferResult interpret(const S3Exchange& exchange, const ObjectToStore& object,
+                                 const std::string& md5Hex,
+                                 const std::vector<std::string>& secrets);
+    // Success when the answer's ETag is the body's MD5 (or S3 checked it under SSE-KMS).
+    FileTransferResult checkStored(const S3Exchange& exchange, const std::string& where,
+                                   size_t size, const std::string& md5Hex);
+    // After RequestTimeTooSkewed: the signing clock follows the server's.
+    void correctClock(const S3Response& response);
+
     const S3StoreConfig config_;
     bool endpointValid_ = false;  // config_.endpoint passed Parse
     std::string endpoint_;        // its normal form

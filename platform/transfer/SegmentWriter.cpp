@@ -161,6 +161,214 @@ bool describeStream(Track& track, AVCodecParameters* parameters, std::string* wh
     return true;
 }
 
+// One object on its way through the muxer, for the length of one Write: the three tracks, the
+// muxer over the caller's buffer, and what went in. Each step returns false with the reason in
+// the caller's error text.
+class ObjectMuxer {
+  public:
+    ObjectMuxer(const std::vector<StreamData>& video, const std::vector<StreamData>& audio,
+                const std::vector<StreamData>& meta, std::vector<uint8_t>* out,
+                SegmentWriter::Report* report, std::string* error)
+        : out_(out), report_(report), error_(error) {
+        tracks_[0] = {TrackDescription::Kind::Video, &video};
+        tracks_[1] = {TrackDescription::Kind::Audio, &audio};
+        tracks_[2] = {TrackDescription::Kind::Meta, &meta};
+    }
+
+    // Opens the muxer over the caller's buffer and reserves room for the whole object.
+    bool Open() {
+        size_t payloadBytes = 0;
+        for (Track& track : tracks_) {
+            for (const StreamData& sample : *track.samples) {
+                payloadBytes += sample.PayloadBytes();
+                if (!track.description && sample.source)
+                    track.description = sample.source->Track().get();
+            }
+        }
+        int rc = avformat_alloc_output_context2(&muxer_.context, nullptr, "mpegts", nullptr);
+        if (rc < 0 || !muxer_.context)
+            return fail("cannot create the mpegts muxer: " + avError(rc));
+        auto* ioBuffer = static_cast<unsigned char*>(av_malloc(kAvioBufferSize));
+        if (!ioBuffer) return fail("out of memory");
+        muxer_.io = avio_alloc_context(ioBuffer, kAvioBufferSize, 1, out_, nullptr, appendToBuffer,
+                                       nullptr);
+        if (!muxer_.io) {
+            av_free(ioBuffer);
+            return fail("out of memory");
+        }
+        muxer_.packet = av_packet_alloc();
+        if (!muxer_.packet) return fail("out of memory");
+        AVFormatContext* context = muxer_.context;
+        context->pb = muxer_.io;
+        context->flags |= AVFMT_FLAG_CUSTOM_IO;
+        // Times are kept as they are: the run's offset already makes them non-negative, and a
+        // shift of one object alone would break continuity with its neighbours. Payloads are
+        // Annex B by contract; the muxer is not allowed to slip a bitstream filter (and a copy) in.
+        context->avoid_negative_ts = AVFMT_AVOID_NEG_TS_DISABLED;
+        context->flags &= ~AVFMT_FLAG_AUTO_BSF;
+        // TS overhead (headers, PES, PAT/PMT) stays well under 10 % of the payload.
+        out_->reserve(payloadBytes + payloadBytes / 10 + 4096);
+        return true;
+    }
+
+    // One stream per list that has samples. Audio the object cannot carry is left out and
+    // counted; the first such refusal of the run is logged (`*refusalLogged` remembers it).
+    bool AddStreams(bool* refusalLogged) {
+        for (Track& track : tracks_) {
+            if (!track.samples->empty() && !addStream(track, refusalLogged)) return false;
+        }
+        if (muxer_.context->nb_streams == 0) return fail("no track can be written");
+        return true;
+    }
+
+    // The earliest decode time (90 kHz, no offset) among the first usable samples of the
+    // tracks that are written.
+    bool EarliestDecodeTime(int64_t* earliest) {
+        bool found = false;
+        for (Track& track : tracks_) {
+            if (!track.stream) continue;
+            for (const StreamData& sample : *track.samples) {
+                int64_t pts = 0, dts = 0;
+                if (!usablePayload(sample, track.codec) ||
+                    !sampleTimes(sample, track.kind, track.description, &pts, &dts))
+                    continue;
+                if (!found || dts < *earliest) *earliest = dts;
+                found = true;
+                break;
+            }
+        }
+        if (found) return true;
+        report_->dropped =
+            tracks_[0].samples->size() + tracks_[1].samples->size() + tracks_[2].samples->size();
+        return fail("no sample has a payload and usable times");
+    }
+
+    // Header, every usable sample merged by decode time with `offset90k` added, trailer.
+    bool WriteAll(int64_t offset90k) {
+        int rc = avformat_write_header(muxer_.context, nullptr);
+        if (rc < 0) return fail("cannot start the TS object: " + avError(rc));
+        int64_t pts = 0, dts = 0;
+        while (Track* track = nextSample(offset90k, &pts, &dts)) {
+            if (!writeSample(*track, pts, dts)) return false;
+        }
+        rc = av_write_trailer(muxer_.context);
+        if (rc < 0) return fail("cannot finish the TS object: " + avError(rc));
+        if (report_->written == 0) return fail("no sample could be written");
+        return true;
+    }
+
+  private:
+    bool fail(std::string why) {
+        *error_ = std::move(why);
+        return false;
+    }
+
+    bool addStream(Track& track, bool* refusalLogged) {
+        std::unique_ptr<AVCodecParameters, void (*)(AVCodecParameters*)> parameters(
+            avcodec_parameters_alloc(), [](AVCodecParameters* p) { avcodec_parameters_free(&p); });
+        if (!parameters) return fail("out of memory");
+        std::string why;
+        bool described = describeStream(track, parameters.get(), &why);
+        if (described && track.kind == TrackDescription::Kind::Audio &&
+            !audioTravelsInTs(track.codec)) {
+            described = false;
+            why = std::string(avcodec_get_name(track.codec)) + " cannot travel in MPEG-TS";
+        }
+        if (!described) {
+            if (track.kind != TrackDescription::Kind::Audio) return fail(why);
+            // Without its audio the object is still worth having.
+            if (!*refusalLogged) {
+                Logger::Put(5, kFile, kFunction, __LINE__, "audio is left out of the objects: %s",
+                            why.c_str());
+                *refusalLogged = true;
+            }
+            report_->dropped += track.samples->size();
+            return true;
+        }
+        AVStream* stream = avformat_new_stream(muxer_.context, nullptr);
+        if (!stream || avcodec_parameters_copy(stream->codecpar, parameters.get()) < 0)
+            return fail("out of memory");
+        stream->time_base = AVRational{1, static_cast<int>(kTicksPerSecond)};
+        track.stream = stream;
+        return true;
+    }
+
+    // Whether the muxer can take `sample` as the next one of `track`; its times with the
+    // offset applied in `pts` and `dts`.
+    static bool usableNext(const Track& track, const StreamData& sample, int64_t offset90k,
+                           int64_t* pts, int64_t* dts) {
+        if (!usablePayload(sample, track.codec) ||
+            !sampleTimes(sample, track.kind, track.description, pts, dts))
+            return false;
+        *pts += offset90k;
+        *dts += offset90k;
+        const bool increasing = track.kind == TrackDescription::Kind::Meta
+                                    ? *dts >= track.lastDts90k
+                                    : *dts > track.lastDts90k;
+        return *dts >= 0 && *pts >= *dts && (!track.hasLast || increasing);
+    }
+
+    // The track whose next usable sample has the smallest decode time (ties go to video, then
+    // audio, then meta), with that sample's times; null when every track is done. Samples the
+    // muxer cannot take are skipped and counted on the way.
+    Track* nextSample(int64_t offset90k, int64_t* chosenPts, int64_t* chosenDts) {
+        Track* chosen = nullptr;
+        for (Track& track : tracks_) {
+            if (!track.stream) continue;
+            for (; track.next < track.samples->size(); ++track.next, ++report_->dropped) {
+                int64_t pts = 0, dts = 0;
+                if (!usableNext(track, (*track.samples)[track.next], offset90k, &pts, &dts))
+                    continue;
+                if (!chosen || dts < *chosenDts) {
+                    chosen = &track;
+                    *chosenPts = pts;
+                    *chosenDts = dts;
+                }
+                break;
+            }
+        }
+        return chosen;
+    }
+
+    bool writeSample(Track& track, int64_t pts, int64_t dts) {
+        const StreamData& sample = (*track.samples)[track.next];
+        const uint8_t* data = sample.PayloadData();
+        const size_t size = sample.PayloadBytes();
+        bool key = true;
+        if (track.codec == AV_CODEC_ID_H264)
+            key = nal_access::StreamAnalyzer::IsIdrH264(data, size);
+        else if (track.codec == AV_CODEC_ID_HEVC)
+            key = nal_access::StreamAnalyzer::IsIdrH265(data, size);
+
+        // Not reference counted: av_write_frame reads the bytes during the call and keeps no
+        // reference, so the sample's own buffer is used as it is.
+        AVPacket* packet = muxer_.packet;
+        av_packet_unref(packet);
+        packet->data = const_cast<uint8_t*>(data);
+        packet->size = static_cast<int>(size);
+        packet->stream_index = track.stream->index;
+        const AVRational ticks{1, static_cast<int>(kTicksPerSecond)};
+        packet->pts = av_rescale_q(pts, ticks, track.stream->time_base);
+        packet->dts = av_rescale_q(dts, ticks, track.stream->time_base);
+        packet->flags = key ? AV_PKT_FLAG_KEY : 0;
+        int rc = av_write_frame(muxer_.context, packet);
+        packet->data = nullptr;
+        packet->size = 0;
+        if (rc < 0) return fail("the muxer refused a sample: " + avError(rc));
+        track.hasLast = true;
+        track.lastDts90k = dts;
+        ++track.next;
+        ++report_->written;
+        return true;
+    }
+
+    Track tracks_[3];
+    Muxer muxer_;
+    std::vector<uint8_t>* const out_;
+    SegmentWriter::Report* const report_;
+    std::string* const error_;
+};
+
 }  // namespace
 
 bool SegmentWriter::Write(const std::vector<StreamData>& video,
@@ -173,208 +381,15 @@ bool SegmentWriter::Write(const std::vector<StreamData>& video,
     if (!error) error = &localError;
     out->clear();
 
-    Track tracks[3];
-    tracks[0].kind = TrackDescription::Kind::Video;
-    tracks[0].samples = &video;
-    tracks[1].kind = TrackDescription::Kind::Audio;
-    tracks[1].samples = &audio;
-    tracks[2].kind = TrackDescription::Kind::Meta;
-    tracks[2].samples = &meta;
-
-    size_t payloadBytes = 0;
-    for (Track& track : tracks) {
-        for (const StreamData& sample : *track.samples) {
-            payloadBytes += sample.PayloadBytes();
-            if (!track.description && sample.source)
-                track.description = sample.source->Track().get();
-        }
-    }
-
-    Muxer muxer;
-    int rc = avformat_alloc_output_context2(&muxer.context, nullptr, "mpegts", nullptr);
-    if (rc < 0 || !muxer.context) {
-        *error = "cannot create the mpegts muxer: " + avError(rc);
-        return false;
-    }
-    auto* ioBuffer = static_cast<unsigned char*>(av_malloc(kAvioBufferSize));
-    if (!ioBuffer) {
-        *error = "out of memory";
-        return false;
-    }
-    muxer.io =
-        avio_alloc_context(ioBuffer, kAvioBufferSize, 1, out, nullptr, appendToBuffer, nullptr);
-    if (!muxer.io) {
-        av_free(ioBuffer);
-        *error = "out of memory";
-        return false;
-    }
-    muxer.packet = av_packet_alloc();
-    if (!muxer.packet) {
-        *error = "out of memory";
-        return false;
-    }
-    AVFormatContext* context = muxer.context;
-    context->pb = muxer.io;
-    context->flags |= AVFMT_FLAG_CUSTOM_IO;
-    // Times are kept as they are: the run's offset already makes them non-negative, and a
-    // shift of one object alone would break continuity with its neighbours. Payloads are Annex
-    // B by contract; the muxer is not allowed to slip a bitstream filter (and a copy) in.
-    context->avoid_negative_ts = AVFMT_AVOID_NEG_TS_DISABLED;
-    context->flags &= ~AVFMT_FLAG_AUTO_BSF;
-
-    // TS overhead (headers, PES, PAT/PMT) stays well under 10 % of the payload.
-    out->reserve(payloadBytes + payloadBytes / 10 + 4096);
-
-    for (Track& track : tracks) {
-        if (track.samples->empty()) continue;
-        std::unique_ptr<AVCodecParameters, void (*)(AVCodecParameters*)> parameters(
-            avcodec_parameters_alloc(), [](AVCodecParameters* p) { avcodec_parameters_free(&p); });
-        if (!parameters) {
-            *error = "out of memory";
-            return false;
-        }
-        std::string why;
-        bool described = describeStream(track, parameters.get(), &why);
-        if (described && track.kind == TrackDescription::Kind::Audio &&
-            !audioTravelsInTs(track.codec)) {
-            described = false;
-            why = std::string(avcodec_get_name(track.codec)) + " cannot travel in MPEG-TS";
-        }
-        if (!described) {
-            if (track.kind != TrackDescription::Kind::Audio) {
-                *error = why;
-                return false;
-            }
-            // Without its audio the object is still worth having.
-            if (!audioRefusalLogged_) {
-                Logger::Put(5, kFile, kFunction, __LINE__, "audio is left out of the objects: %s",
-                            why.c_str());
-                audioRefusalLogged_ = true;
-            }
-            report->dropped += track.samples->size();
-            continue;
-        }
-        AVStream* stream = avformat_new_stream(context, nullptr);
-        if (!stream || avcodec_parameters_copy(stream->codecpar, parameters.get()) < 0) {
-            *error = "out of memory";
-            return false;
-        }
-        stream->time_base = AVRational{1, static_cast<int>(kTicksPerSecond)};
-        track.stream = stream;
-    }
-
-    if (context->nb_streams == 0) {
-        *error = "no track can be written";
-        return false;
-    }
+    ObjectMuxer object(video, audio, meta, out, report, error);
+    if (!object.Open() || !object.AddStreams(&audioRefusalLogged_)) return false;
     // The run's origin: the earliest decode time among the first usable samples of the first
     // object lands on kRunOrigin90k. Later objects reuse the same offset.
     if (!hasOffset_) {
-        bool found = false;
         int64_t earliest = 0;
-        for (Track& track : tracks) {
-            if (!track.stream) continue;
-            for (const StreamData& sample : *track.samples) {
-                int64_t pts = 0, dts = 0;
-                if (!usablePayload(sample, track.codec) ||
-                    !sampleTimes(sample, track.kind, track.description, &pts, &dts))
-                    continue;
-                if (!found || dts < earliest) earliest = dts;
-                found = true;
-                break;
-            }
-        }
-        if (!found) {
-            report->dropped = video.size() + audio.size() + meta.size();
-            *error = "no sample has a payload and usable times";
-            return false;
-        }
+        if (!object.EarliestDecodeTime(&earliest)) return false;
         offset90k_ = kRunOrigin90k - earliest;
         hasOffset_ = true;
     }
-
-    rc = avformat_write_header(context, nullptr);
-    if (rc < 0) {
-        *error = "cannot start the TS object: " + avError(rc);
-        return false;
-    }
-
-    // Merge the lists by decode time. Ties go to video, then audio, then meta.
-    AVPacket* packet = muxer.packet;
-    while (true) {
-        Track* chosen = nullptr;
-        int64_t chosenPts = 0, chosenDts = 0;
-        for (Track& track : tracks) {
-            if (!track.stream) continue;
-            // Skip what the muxer cannot take; stop at the first usable sample.
-            while (track.next < track.samples->size()) {
-                const StreamData& sample = (*track.samples)[track.next];
-                int64_t pts = 0, dts = 0;
-                bool usable = usablePayload(sample, track.codec) &&
-                              sampleTimes(sample, track.kind, track.description, &pts, &dts);
-                if (usable) {
-                    pts += offset90k_;
-                    dts += offset90k_;
-                    bool increasing = track.kind == TrackDescription::Kind::Meta
-                                          ? dts >= track.lastDts90k
-                                          : dts > track.lastDts90k;
-                    usable = dts >= 0 && pts >= dts && (!track.hasLast || increasing);
-                }
-                if (usable) {
-                    if (!chosen || dts < chosenDts) {
-                        chosen = &track;
-                        chosenPts = pts;
-                        chosenDts = dts;
-                    }
-                    break;
-                }
-                ++report->dropped;
-                ++track.next;
-            }
-        }
-        if (!chosen) break;
-
-        const StreamData& sample = (*chosen->samples)[chosen->next];
-        const uint8_t* data = sample.PayloadData();
-        const size_t size = sample.PayloadBytes();
-        bool key = true;
-        if (chosen->codec == AV_CODEC_ID_H264)
-            key = nal_access::StreamAnalyzer::IsIdrH264(data, size);
-        else if (chosen->codec == AV_CODEC_ID_HEVC)
-            key = nal_access::StreamAnalyzer::IsIdrH265(data, size);
-
-        // Not reference counted: av_write_frame reads the bytes during the call and keeps no
-        // reference, so the sample's own buffer is used as it is.
-        av_packet_unref(packet);
-        packet->data = const_cast<uint8_t*>(data);
-        packet->size = static_cast<int>(size);
-        packet->stream_index = chosen->stream->index;
-        packet->pts = av_rescale_q(chosenPts, AVRational{1, static_cast<int>(kTicksPerSecond)},
-                                   chosen->stream->time_base);
-        packet->dts = av_rescale_q(chosenDts, AVRational{1, static_cast<int>(kTicksPerSecond)},
-                                   chosen->stream->time_base);
-        packet->flags = key ? AV_PKT_FLAG_KEY : 0;
-        rc = av_write_frame(context, packet);
-        packet->data = nullptr;
-        packet->size = 0;
-        if (rc < 0) {
-            *error = "the muxer refused a sample: " + avError(rc);
-            return false;
-        }
-        chosen->hasLast = true;
-        chosen->lastDts90k = chosenDts;
-        ++chosen->next;
-        ++report->written;
-    }
-
-    rc = av_write_trailer(context);
-    if (rc < 0) {
-        *error = "cannot finish the TS object: " + avError(rc);
-        return false;
-    }
-    if (report->written == 0) {
-        *error = "no sample could be written";
-        return false;
-    }
-    return true;
+    return object.WriteAll(offset90k_);
 }

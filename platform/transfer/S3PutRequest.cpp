@@ -1,0 +1,62 @@
+#include "platform/transfer/S3PutRequest.h"
+
+#include <cctype>
+#include <set>
+
+#include "platform/transfer/Digest.h"
+#include "platform/transfer/HttpText.h"
+#include "platform/transfer/SigV4Signer.h"
+
+namespace {
+
+// Header values are signed in canonical form and sent in that form, printable only.
+std::string HeaderValue(const std::string& value) {
+    return httptext::FoldSpaces(value, true);
+}
+
+// A metadata name as an HTTP token: lower case letters, digits, '-' and '_'.
+std::string MetadataName(const std::string& name) {
+    std::string out = httptext::Lower(name);
+    for (char& c : out) {
+        if (!std::isalnum(static_cast<unsigned char>(c)) && c != '-' && c != '_') c = '-';
+    }
+    return out;
+}
+
+void AddMetadata(const ObjectToStore& object, SigV4Request& request) {
+    std::set<std::string> names;
+    for (const auto& [name, value] : object.metadata) {
+        std::string header = "x-amz-meta-" + MetadataName(name);
+        if (name.empty() || !names.insert(header).second) continue;
+        request.headers.emplace_back(header, HeaderValue(value));
+    }
+}
+
+}  // namespace
+
+S3PutRequest SignS3Put(const S3Target& target, const ObjectToStore& object,
+                       const StoreCredentials& credentials, const std::string& amzDate) {
+    S3PutRequest out;
+    const digest::Md5 md5 = digest::Md5Of(object.data, object.size);
+    out.md5Hex = digest::Hex(md5);
+
+    SigV4Request request;
+    request.method = "PUT";
+    request.canonicalUri = target.canonicalUri;
+    request.payloadHash = digest::Hex(digest::Sha256Of(object.data, object.size));
+    request.headers = {{"host", target.host},
+                       {"content-md5", digest::Base64(md5)},
+                       {"content-type", HeaderValue(object.contentType)},
+                       {"x-amz-content-sha256", request.payloadHash},
+                       {"x-amz-date", amzDate}};
+    if (!credentials.sessionToken.empty())
+        request.headers.emplace_back("x-amz-security-token", HeaderValue(credentials.sessionToken));
+    AddMetadata(object, request);
+
+    const SigV4Key key{credentials.accessKey, credentials.secretKey, target.signingRegion, "s3"};
+    const SigV4Signature signature = SigV4Signer::Sign(request, key, amzDate);
+    out.headers = std::move(request.headers);
+    out.authorization = signature.authorization;
+    out.signature = signature.signature;
+    return out;
+}

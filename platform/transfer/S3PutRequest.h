@@ -1,0 +1,30 @@
+// S3PutRequest: the header lines of one S3 PUT of an object, signed with AWS Signature V4.
+//
+// SignS3Put is a pure function of the target, the object, the credentials and the signing
+// time; safe from any thread. Every value is sent in the form it was signed in, and no value
+// carries a line break or another control character (such a value would add a header of its
+// own), so any server signs exactly what it received.
+//
+// Headers: host, Content-MD5, Content-Type, x-amz-content-sha256 (the body's SHA-256),
+// x-amz-date, x-amz-security-token when there is a session token, and the object's metadata as
+// x-amz-meta-* (names folded to HTTP tokens; of two names that fold into one, the first wins).
+#pragma once
+
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "platform/transfer/ObjectStore.h"
+#include "platform/transfer/S3Target.h"
+
+struct S3PutRequest {
+    // Every signed header, names in lower case, values as sent.
+    std::vector<std::pair<std::string, std::string>> headers;
+    std::string authorization;  // the Authorization header value; never log it
+    std::string signature;      // its hex signature, to keep it out of log lines
+    std::string md5Hex;         // the body's MD5, to compare with the ETag of the answer
+};
+
+// Signs the PUT of `object` to `target` at `amzDate` ("YYYYMMDDTHHMMSSZ").
+S3PutRequest SignS3Put(const S3Target& target, const ObjectToStore& object,
+                       const StoreCredentials& credentials, const std::string& amzDate);
