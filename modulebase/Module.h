@@ -13,6 +13,7 @@
 
 #include <atomic>
 #include <condition_variable>
+#include <cstdint>
 #include <memory>
 #include <mutex>
 #include <thread>
@@ -29,9 +30,10 @@ class Module : public ModuleInterface {
     void PushAudio(std::shared_ptr<StreamData> sample) override;
     void PushMeta(std::shared_ptr<StreamData> sample) override;
     void Restart() override;
-    // Pushes a marker into each queue in turn and waits until its worker has handled that very
-    // marker, so every flush waits for what was queued before it (an earlier flush or stop
-    // does not satisfy a later one). A queue whose worker is not running is not waited for.
+    // Pushes a marker into each queue in turn and waits until its worker has handled that
+    // marker, identified by its queue ticket, so every flush waits for what was queued before
+    // it (an earlier flush or stop does not satisfy a later one). A queue whose worker is not
+    // running is not waited for.
     void FlushQueues() override;
     // Removes every queued real sample; markers stay.
     void ClearQueues() override;
@@ -47,26 +49,21 @@ class Module : public ModuleInterface {
 
   private:
     using Queue = BoundedQueue<std::shared_ptr<StreamData>>;
-    enum class Media { Video, Audio, Meta };
-    void workerLoop(Media media);
+    enum Media { kVideo, kAudio, kMeta, kMediaCount };
 
-    Queue videoQueue_{50};
-    Queue audioQueue_{20};
-    Queue metaQueue_{20};
-    std::shared_ptr<std::thread> videoWorker_;
-    std::shared_ptr<std::thread> audioWorker_;
-    std::shared_ptr<std::thread> metaWorker_;
-    std::condition_variable videoMarkerCondition_;
-    bool videoMarkerSeen_ = false;  // guarded by markerMutex_, as are the *LastMarker_ fields
-    const StreamData* videoLastMarker_ = nullptr;  // the marker the worker handled last
-    std::condition_variable audioMarkerCondition_;
-    bool audioMarkerSeen_ = false;
-    const StreamData* audioLastMarker_ = nullptr;
-    std::condition_variable metaMarkerCondition_;
-    bool metaMarkerSeen_ = false;
-    const StreamData* metaLastMarker_ = nullptr;
-    std::mutex markerMutex_;
-    std::atomic<bool> videoRunning_{false};
-    std::atomic<bool> audioRunning_{false};
-    std::atomic<bool> metaRunning_{false};
+    // One media type's queue and the worker that empties it.
+    struct Lane {
+        explicit Lane(uint64_t capacity) : queue(capacity) {}
+        Queue queue;
+        std::shared_ptr<std::thread> worker;
+        std::condition_variable markerHandled;  // a marker was handled; FlushQueues waits
+        uint64_t markerTicket = 0;  // queue ticket of the newest marker handled; markerMutex_
+        std::atomic<bool> running{false};
+    };
+
+    void workerLoop(Media media);
+    void process(Media media, std::shared_ptr<StreamData> sample);
+
+    Lane lanes_[kMediaCount]{Lane(50), Lane(20), Lane(20)};
+    std::mutex markerMutex_;  // guards every lane's markerTicket
 };

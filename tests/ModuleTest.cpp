@@ -1,7 +1,10 @@
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <condition_variable>
+#include <cstdlib>
 #include <mutex>
+#include <new>
 #include <numeric>
 #include <vector>
 
@@ -13,6 +16,60 @@
 
 using testsupport::MakeSample;
 using testsupport::WaitUntil;
+
+namespace {
+
+// While on, a freed block is handed out again for the next allocation of its size, newest
+// first, as glibc's per-thread cache does, but deterministically and also under the
+// sanitizers, whose quarantine keeps a freed address out of use for a long time.
+std::atomic<bool> recycling{false};
+std::mutex recycleMutex;  // guards freeBlocks
+constexpr size_t kHeader = alignof(std::max_align_t);
+constexpr size_t kSizeClasses = 64;  // blocks up to 1 KiB, in steps of kHeader bytes
+void* freeBlocks[kSizeClasses];      // per size class, a list linked through the blocks
+
+size_t sizeClass(size_t bytes) {
+    return (bytes + kHeader - 1) / kHeader;
+}
+
+struct Recycling {
+    Recycling() { recycling = true; }
+    ~Recycling() { recycling = false; }
+};
+
+}  // namespace
+
+void* operator new(size_t bytes) {
+    const size_t cls = sizeClass(bytes);
+    if (recycling && cls < kSizeClasses) {
+        std::lock_guard<std::mutex> lock(recycleMutex);
+        if (void* block = freeBlocks[cls]) {
+            freeBlocks[cls] = *static_cast<void**>(block);
+            return block;
+        }
+    }
+    auto* raw = static_cast<char*>(std::malloc(cls * kHeader + kHeader));
+    if (!raw) throw std::bad_alloc();
+    *reinterpret_cast<size_t*>(raw) = cls;
+    return raw + kHeader;
+}
+
+void operator delete(void* block) noexcept {
+    if (!block) return;
+    char* raw = static_cast<char*>(block) - kHeader;
+    const size_t cls = *reinterpret_cast<size_t*>(raw);
+    if (recycling && cls < kSizeClasses) {
+        std::lock_guard<std::mutex> lock(recycleMutex);
+        *static_cast<void**>(block) = freeBlocks[cls];
+        freeBlocks[cls] = block;
+        return;
+    }
+    std::free(raw);
+}
+
+void operator delete(void* block, size_t) noexcept {
+    operator delete(block);
+}
 
 namespace {
 
@@ -43,9 +100,10 @@ class RecordingModule : public Module {
         changed.notify_all();
     }
     // Pushes video sample `t` and waits until the video hook holds it.
-    bool HoldVideoAt(uint64_t t) {
+    bool HoldVideoAt(uint64_t t) { return HoldVideo(MakeSample(t)); }
+    bool HoldVideo(std::shared_ptr<StreamData> sample) {
         holdVideo = true;
-        PushVideo(MakeSample(t));
+        PushVideo(std::move(sample));
         return WaitUntil([&] { return Copy(videoEntered); });
     }
     template <typename T>
@@ -149,6 +207,49 @@ TEST(ModuleWorkers, EveryFlushWaitsForWhatWasQueuedBeforeItAndMarkersNeverReachT
         for (int i = 0; i < 15; ++i) module.PushAudio(MakeSample(round * 100 + i));
         module.FlushQueues();
         EXPECT_EQ(module.Count(module.audio), static_cast<size_t>((round + 1) * 15));
+    }
+}
+
+// A flush must wait for its own marker even where an earlier marker's memory is reused: the
+// video hook is held while samples and the new marker queue behind it.
+TEST(ModuleWorkers, AFlushWaitsForTheSamplesBeforeItWhereAnEarlierMarkerLay) {
+    const struct {
+        const char* before;
+        void (*step)(RecordingModule&);
+    } cases[] = {
+        {"an earlier flush", [](RecordingModule& m) { m.FlushQueues(); }},
+        {"a restart", [](RecordingModule& m) { m.Restart(); }},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.before);
+        // Every sample exists before the earlier marker is freed and stays alive, so the next
+        // block of a sample's size that is handed out is the new flush's marker.
+        std::vector<std::shared_ptr<StreamData>> samples;
+        for (uint64_t t = 0; t < 12; ++t) samples.push_back(MakeSample(t));
+        RecordingModule module;
+        module.Initialize(nullptr);
+        module.StartThreads();
+        Recycling recycling;
+        c.step(module);
+        // Each worker handles a sample, so it has let go of the earlier marker.
+        module.PushAudio(samples[10]);
+        module.PushMeta(samples[11]);
+        ASSERT_TRUE(module.HoldVideo(samples[0]));
+        ASSERT_TRUE(WaitUntil(
+            [&] { return module.Count(module.audio) == 1 && module.Count(module.meta) == 1; }));
+        for (size_t i = 1; i < 10; ++i) module.PushVideo(samples[i]);
+
+        std::atomic<bool> returned{false};
+        size_t handledAtReturn = 0;
+        std::thread flusher([&] {
+            module.FlushQueues();
+            handledAtReturn = module.Count(module.video);
+            returned = true;
+        });
+        WaitUntil([&] { return returned.load(); }, 300);  // room to return too early
+        module.Release();
+        flusher.join();
+        EXPECT_EQ(handledAtReturn, 10u);
     }
 }
 
