@@ -37,6 +37,7 @@ ObjectToStore Object(const std::string& key, const std::string& body,
     ObjectToStore object;
     object.bucket = bucket;
     object.key = key;
+    object.contentType = "video/mp2t";
     object.metadata = {{"streamingid", "cam 1"}, {"sequencenumber", "7"}, {"duration", "10000"}};
     object.data = reinterpret_cast<const uint8_t*>(body.data());
     object.size = body.size();

@@ -136,8 +136,8 @@ class SegmentWriterClipTest : public ::testing::TestWithParam<ClipCase> {
     std::string Store(SegmentTransfer& transfer, const FileTransferRequest& request) {
         FileTransferInfo info;
         EXPECT_EQ(Success, transfer.Transfer(request, &info));
-        std::string key =
-            ObjectKey("", request.streamingId, request.sequenceNumber, FirstCaptureTime(request));
+        std::string key = ObjectKey("", request.streamingId, request.sequenceNumber,
+                                    FirstCaptureTime(request), ".ts");
         EXPECT_EQ(ReadFile(dir_.Path(key)).size(), info.fileSize);
         return dir_.Path(key);
     }
@@ -229,8 +229,16 @@ TEST(SegmentTransferTest, RequestWithoutSamplesStoresNothing) {
     EXPECT_TRUE(dir.Files().empty());
 }
 
+// Subscribers hear of every stream file that got a key, with what became of it.
+struct EventLog {
+    std::vector<StoredObject> events;
+    ObjectEvents::Subscription subscription =
+        ObjectEvents::Subscribe([this](const StoredObject& e) { events.push_back(e); });
+};
+
 TEST(SegmentTransferTest, RefusedSamplesAreFileBrokenAndCancelEndsEveryLaterTransfer) {
     StoreDirectory dir;
+    EventLog log;
     SegmentTransfer transfer(std::make_shared<LocalDirectoryStore>(dir.Root()), "");
     auto h264 = Track(TrackDescription::Kind::Video, "h264", 90000);
     auto mpeg4 = Track(TrackDescription::Kind::Video, "mpeg4", 90000);
@@ -244,15 +252,20 @@ TEST(SegmentTransferTest, RefusedSamplesAreFileBrokenAndCancelEndsEveryLaterTran
     transfer.Cancel();
     EXPECT_EQ(TimeOut, transfer.Transfer(request, nullptr));
     EXPECT_TRUE(dir.Files().empty());
+    ASSERT_EQ(2u, log.events.size());
+    for (const StoredObject& e : log.events) EXPECT_EQ(FileBroken, e.result);
+    EXPECT_EQ(0u, log.events[0].size);
 }
 
 TEST(SegmentTransferTest, AudioThatCannotTravelInTsIsLeftOutOnce) {
     StoreDirectory dir;
     LogCapture log;
+    EventLog stored;
     SegmentTransfer transfer(std::make_shared<LocalDirectoryStore>(dir.Root()), "p/");
     auto video = Track(TrackDescription::Kind::Video, "h264", 90000);
     auto pcm = Track(TrackDescription::Kind::Audio, "pcm_s16le", 48000);
-    for (int64_t seq = 1; seq <= 2; ++seq) {
+    for (int64_t seq = 1; seq <= 3; ++seq) {
+        if (seq == 3) stored.subscription.Reset();  // no event after the end of a subscription
         FileTransferRequest request = ClipRequest(ClipSamples(), 0, 1, seq);
         for (uint64_t ms = 0; ms < 200; ms += 40) {
             uint64_t t = (seq - 1) * 200 + ms;
@@ -264,8 +277,16 @@ TEST(SegmentTransferTest, AudioThatCannotTravelInTsIsLeftOutOnce) {
         EXPECT_GT(info.fileSize, 0u);
     }
     std::vector<std::string> files = dir.Files();
-    ASSERT_EQ(2u, files.size());
+    ASSERT_EQ(3u, files.size());
     EXPECT_EQ(std::vector<std::string>{"h264,video"}, Streams(files[0]));
+    ASSERT_EQ(2u, stored.events.size());
+    for (int64_t seq = 1; seq <= 2; ++seq) {
+        const StoredObject& e = stored.events[seq - 1];
+        EXPECT_EQ(seq, e.sequenceNumber);
+        EXPECT_EQ(Success, e.result);
+        EXPECT_EQ(kClipCaptureStart + (seq - 1) * 200000, e.captureMicros);
+        EXPECT_EQ(ReadFile(dir.Path(e.key)).size(), e.size) << e.key;
+    }
     size_t refusals = 0;
     for (const auto& r : log.Records())
         refusals += r.message.find("audio is left out") != std::string::npos;
@@ -275,7 +296,7 @@ TEST(SegmentTransferTest, AudioThatCannotTravelInTsIsLeftOutOnce) {
 TEST(ObjectKeyTest, KeyAndMetadataFollowTheFirstSamplesCaptureTime) {
     const uint64_t capture = 1796554810012345ull;  // 2026-12-06T11:00:10.012345Z
     EXPECT_EQ("pre/cam1/2026/12/06/cam1_20261206T110010.012Z_7.ts",
-              ObjectKey("pre/", "cam1", 7, capture));
+              ObjectKey("pre/", "cam1", 7, capture, SegmentFormat::Ts().extension));
     auto metadata = ObjectMetadata("cam\r\n1%", 7, 9966, capture);
     EXPECT_EQ("cam%0D%0A1%25", metadata["streaming-id"]);
     EXPECT_EQ("7", metadata["sequence-number"]);

@@ -1,8 +1,8 @@
 // VqStreamFileTransfer::CreateInterface: the transfer object for this process's options.
 //
 // `-endpoint file:///dir` stores into a local directory; any other endpoint (or none: AWS)
-// stores into S3. Only the `ts` segment format exists. A configuration that cannot work gives an
-// empty pointer and one log line that says why; the endpoint is logged without any user
+// stores into S3, in the segment format of -segmentformat. A configuration that cannot work
+// gives an empty pointer and one log line that says why; the endpoint is logged without any user
 // information it may carry.
 #include <cctype>
 #include <string>
@@ -12,6 +12,7 @@
 #include "platform/transfer/FileTransfer.h"
 #include "platform/transfer/LocalDirectoryStore.h"
 #include "platform/transfer/S3Store.h"
+#include "platform/transfer/SegmentFormat.h"
 #include "platform/transfer/SegmentTransfer.h"
 
 namespace {
@@ -78,10 +79,11 @@ std::shared_ptr<IObjectStore> createS3Store(const FrameworkOptions& options) {
 
 std::shared_ptr<IFileTransfer> VqStreamFileTransfer::CreateInterface() {
     const FrameworkOptions& options = CurrentFrameworkOptions();
-    if (options.segmentFormat != "ts") {
+    const SegmentFormat* format = SegmentFormat::Find(options.segmentFormat);
+    if (!format) {
         Logger::Put(4, kFile, kFunction, __LINE__,
-                    "segment format \"%s\" is not supported (only \"ts\")",
-                    options.segmentFormat.c_str());
+                    "segment format \"%s\" is not supported (only %s)",
+                    options.segmentFormat.c_str(), SegmentFormat::Names().c_str());
         return nullptr;
     }
     std::shared_ptr<IObjectStore> store;
@@ -99,5 +101,5 @@ std::shared_ptr<IFileTransfer> VqStreamFileTransfer::CreateInterface() {
         store = createS3Store(options);
         if (!store) return nullptr;
     }
-    return std::make_shared<SegmentTransfer>(store, options.keyPrefix);
+    return std::make_shared<SegmentTransfer>(store, options.keyPrefix, *format);
 }

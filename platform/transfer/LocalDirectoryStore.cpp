@@ -34,8 +34,8 @@ bool splitKey(const std::string& key, std::vector<std::string>* parts) {
     }
 }
 
-// A unique temporary name in `directory`: hidden, and without the ".ts" that ends every key
-// the transfer writes.
+// A unique temporary name in `directory`: hidden, and without the extension that ends every
+// key the transfer writes.
 std::string temporaryName(const std::string& directory) {
     static std::atomic<unsigned> counter{0};
     thread_local std::mt19937_64 random{std::random_device{}()};

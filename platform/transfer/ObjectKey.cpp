@@ -58,13 +58,14 @@ std::string IsoUtcTime(uint64_t micros) {
 }
 
 std::string ObjectKey(const std::string& keyPrefix, const std::string& streamingId,
-                      int64_t sequenceNumber, uint64_t captureMicros) {
+                      int64_t sequenceNumber, uint64_t captureMicros,
+                      const std::string& extension) {
     UtcParts t = split(captureMicros);
     char day[32];
     std::snprintf(day, sizeof(day), "%04d/%02d/%02d", t.calendar.tm_year + 1900,
                   t.calendar.tm_mon + 1, t.calendar.tm_mday);
     return keyPrefix + streamingId + "/" + day + "/" + streamingId + "_" +
-           CompactUtcTime(captureMicros) + "_" + std::to_string(sequenceNumber) + ".ts";
+           CompactUtcTime(captureMicros) + "_" + std::to_string(sequenceNumber) + extension;
 }
 
 std::map<std::string, std::string> ObjectMetadata(const std::string& streamingId,

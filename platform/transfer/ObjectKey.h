@@ -1,6 +1,6 @@
 // ObjectKey: where a stream file is stored, and the metadata its object carries.
 //
-// Key: <keyPrefix><streamingId>/<YYYY>/<MM>/<DD>/<streamingId>_<YYYYMMDDThhmmss.mmmZ>_<seq>.ts
+// Key: <keyPrefix><streamingId>/<YYYY>/<MM>/<DD>/<streamingId>_<YYYYMMDDThhmmss.mmmZ>_<seq><ext>
 // with the wall-clock capture time (UTC) of the object's first sample. The capture time makes
 // the keys of two runs of one stream differ although sequence numbers restart at 1.
 //
@@ -22,8 +22,9 @@ std::string CompactUtcTime(uint64_t micros);
 // `micros` as 2026-12-06T11:00:10.012Z.
 std::string IsoUtcTime(uint64_t micros);
 
+// `extension` is the segment format's (".ts").
 std::string ObjectKey(const std::string& keyPrefix, const std::string& streamingId,
-                      int64_t sequenceNumber, uint64_t captureMicros);
+                      int64_t sequenceNumber, uint64_t captureMicros, const std::string& extension);
 
 // The object's metadata (names without a transport prefix): "streaming-id", "sequence-number",
 // "duration-ms", "capture-time" (ISO 8601, UTC). Values are printable ASCII: other bytes and

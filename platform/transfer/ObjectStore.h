@@ -16,9 +16,9 @@
 // One object to store. `data` stays valid for the whole Put.
 struct ObjectToStore {
     std::string bucket;
-    std::string key;  // not percent-encoded
-    std::string contentType = "video/mp2t";
-    std::map<std::string, std::string> metadata;  // names without the x-amz-meta- prefix
+    std::string key;                                       // not percent-encoded
+    std::string contentType = "application/octet-stream";  // the segment format's
+    std::map<std::string, std::string> metadata;           // names without the x-amz-meta- prefix
     const uint8_t* data = nullptr;
     size_t size = 0;
 };

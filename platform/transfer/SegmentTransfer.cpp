@@ -10,8 +10,12 @@ constexpr const char* kFile = "platform/transfer/SegmentTransfer";
 constexpr const char* kFunction = "SegmentTransfer::Transfer";
 }  // namespace
 
-SegmentTransfer::SegmentTransfer(std::shared_ptr<IObjectStore> store, std::string keyPrefix)
-    : store_(std::move(store)), keyPrefix_(std::move(keyPrefix)) {}
+SegmentTransfer::SegmentTransfer(std::shared_ptr<IObjectStore> store, std::string keyPrefix,
+                                 const SegmentFormat& format)
+    : store_(std::move(store)),
+      keyPrefix_(std::move(keyPrefix)),
+      format_(format),
+      writer_(format) {}
 
 void SegmentTransfer::Cancel() {
     cancelled_ = true;
@@ -34,12 +38,31 @@ FileTransferResult SegmentTransfer::Transfer(const FileTransferRequest& request,
         return Success;
     }
 
+    StoredObject event;
+    event.streamingId = request.streamingId;
+    event.sequenceNumber = request.sequenceNumber;
+    event.bucket = request.bucketName;
+    event.format = &format_;
+    event.durationMs = request.duration;
+    event.captureMicros = FirstCaptureTime(request);
+    event.key = ObjectKey(keyPrefix_, request.streamingId, request.sequenceNumber,
+                          event.captureMicros, format_.extension);
+    event.result = writeAndStore(request, event, info);
+    event.size = info->fileSize;
+    event.responseTimeMs = info->responseTime;
+    ObjectEvents::Publish(event);
+    return event.result;
+}
+
+FileTransferResult SegmentTransfer::writeAndStore(const FileTransferRequest& request,
+                                                  const StoredObject& event,
+                                                  FileTransferInfo* info) {
     SegmentWriter::Report report;
     std::string error;
     if (!writer_.Write(request.video, request.audio, request.meta, &object_, &report, &error)) {
         Logger::Put(5, kFile, kFunction, __LINE__,
-                    "cannot write stream file %" PRId64 " of %s as MPEG-TS: %s",
-                    request.sequenceNumber, request.streamingId.c_str(), error.c_str());
+                    "cannot write stream file %" PRId64 " of %s as %s: %s", request.sequenceNumber,
+                    request.streamingId.c_str(), format_.title.c_str(), error.c_str());
         return FileBroken;
     }
     if (report.dropped > 0)
@@ -50,12 +73,12 @@ FileTransferResult SegmentTransfer::Transfer(const FileTransferRequest& request,
                     request.sequenceNumber, request.streamingId.c_str(), report.dropped,
                     report.dropped + report.written);
 
-    const uint64_t capture = FirstCaptureTime(request);
     ObjectToStore object;
-    object.bucket = request.bucketName;
-    object.key = ObjectKey(keyPrefix_, request.streamingId, request.sequenceNumber, capture);
-    object.metadata =
-        ObjectMetadata(request.streamingId, request.sequenceNumber, request.duration, capture);
+    object.bucket = event.bucket;
+    object.key = event.key;
+    object.contentType = format_.contentType;
+    object.metadata = ObjectMetadata(request.streamingId, request.sequenceNumber, request.duration,
+                                     event.captureMicros);
     object.data = object_.data();
     object.size = object_.size();
 

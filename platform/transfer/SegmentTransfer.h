@@ -1,13 +1,14 @@
 // SegmentTransfer: the transfer object that VqStreamFileTransfer::CreateInterface returns.
 //
-// Transfer turns the request's samples into one MPEG-TS object (SegmentWriter), names it
-// (ObjectKey) and hands it to its store. One object serves one connection of the recorder: the
-// writer's timeline offset is fixed by its first object, so the objects of one connection are
-// continuous.
+// Transfer turns the request's samples into one object of its segment format (SegmentWriter),
+// names it (ObjectKey) and hands it to its store, then publishes what happened as an
+// ObjectEvents event. One object serves one connection of the recorder: the writer's timeline
+// offset is fixed by its first object, so the objects of one connection are continuous.
 //
-// Results beyond the store's own: a request without samples (a gap) stores nothing and is a
-// Success with fileSize 0; samples the writer cannot turn into an object give FileBroken; after
-// Cancel every Transfer returns TimeOut. Credentials go to the store only and are never logged.
+// Results beyond the store's own: a request without samples (a gap) stores nothing, publishes
+// nothing and is a Success with fileSize 0; samples the writer cannot turn into an object give
+// FileBroken; after Cancel every Transfer returns TimeOut. Credentials go to the store only and
+// are never logged.
 //
 // Threads: Transfer runs on one thread at a time (the recorder's upload thread); Cancel may
 // come from any thread meanwhile and is forwarded to the store, which ends a running Put.
@@ -20,21 +21,29 @@
 #include <vector>
 
 #include "platform/transfer/FileTransfer.h"
+#include "platform/transfer/ObjectEvents.h"
 #include "platform/transfer/ObjectStore.h"
+#include "platform/transfer/SegmentFormat.h"
 #include "platform/transfer/SegmentWriter.h"
 
 class SegmentTransfer : public IFileTransfer {
   public:
     // `keyPrefix` is put in front of every object key as it is (no separator added).
-    SegmentTransfer(std::shared_ptr<IObjectStore> store, std::string keyPrefix);
+    SegmentTransfer(std::shared_ptr<IObjectStore> store, std::string keyPrefix,
+                    const SegmentFormat& format = SegmentFormat::Ts());
 
     FileTransferResult Transfer(const FileTransferRequest& request,
                                 FileTransferInfo* info) override;
     void Cancel() override;
 
   private:
+    // Writes the object and stores it; fills event.size/responseTimeMs through `info`.
+    FileTransferResult writeAndStore(const FileTransferRequest& request, const StoredObject& event,
+                                     FileTransferInfo* info);
+
     const std::shared_ptr<IObjectStore> store_;
     const std::string keyPrefix_;
+    const SegmentFormat& format_;  // a process-wide constant
     SegmentWriter writer_;         // used by Transfer only
     std::vector<uint8_t> object_;  // the last object written; its capacity is reused
     std::atomic<bool> cancelled_{false};

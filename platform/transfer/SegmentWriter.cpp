@@ -29,23 +29,12 @@ std::string avError(int code) {
     return text;
 }
 
-// Audio codecs that the mpegts muxer writes with a stream type a reader recognises.
-bool audioTravelsInTs(AVCodecID id) {
-    switch (id) {
-        case AV_CODEC_ID_AAC:
-        case AV_CODEC_ID_AAC_LATM:
-        case AV_CODEC_ID_MP2:
-        case AV_CODEC_ID_MP3:
-        case AV_CODEC_ID_AC3:
-        case AV_CODEC_ID_EAC3:
-        case AV_CODEC_ID_DTS:
-        case AV_CODEC_ID_TRUEHD:
-        case AV_CODEC_ID_OPUS:
-        case AV_CODEC_ID_S302M:
-            return true;
-        default:
-            return false;
-    }
+// Whether `format` carries audio of codec `id` with a type its readers recognise.
+bool carriesAudio(const SegmentFormat& format, AVCodecID id) {
+    const std::string name = avcodec_get_name(id);
+    for (const std::string& codec : format.audioCodecs)
+        if (codec == name) return true;
+    return false;
 }
 
 // The muxer's output, appended to the caller's buffer.
@@ -144,7 +133,7 @@ bool describeStream(Track& track, AVCodecParameters* parameters, std::string* wh
         if (codec->type == AVMEDIA_TYPE_AUDIO && description)
             parameters->sample_rate = static_cast<int>(description->clockRate);
     }
-    parameters->codec_tag = 0;  // tags of the input's container mean nothing in TS
+    parameters->codec_tag = 0;  // the input container's tags mean nothing in the object
     if (track.kind == TrackDescription::Kind::Meta) {
         // Whatever the input called its data, it travels as a data stream.
         if (parameters->codec_id == AV_CODEC_ID_NONE) parameters->codec_id = AV_CODEC_ID_BIN_DATA;
@@ -166,10 +155,10 @@ bool describeStream(Track& track, AVCodecParameters* parameters, std::string* wh
 // the caller's error text.
 class ObjectMuxer {
   public:
-    ObjectMuxer(const std::vector<StreamData>& video, const std::vector<StreamData>& audio,
-                const std::vector<StreamData>& meta, std::vector<uint8_t>* out,
-                SegmentWriter::Report* report, std::string* error)
-        : out_(out), report_(report), error_(error) {
+    ObjectMuxer(const SegmentFormat& format, const std::vector<StreamData>& video,
+                const std::vector<StreamData>& audio, const std::vector<StreamData>& meta,
+                std::vector<uint8_t>* out, SegmentWriter::Report* report, std::string* error)
+        : format_(format), out_(out), report_(report), error_(error) {
         tracks_[0] = {TrackDescription::Kind::Video, &video};
         tracks_[1] = {TrackDescription::Kind::Audio, &audio};
         tracks_[2] = {TrackDescription::Kind::Meta, &meta};
@@ -206,7 +195,7 @@ class ObjectMuxer {
         // Annex B by contract; the muxer is not allowed to slip a bitstream filter (and a copy) in.
         context->avoid_negative_ts = AVFMT_AVOID_NEG_TS_DISABLED;
         context->flags &= ~AVFMT_FLAG_AUTO_BSF;
-        // TS overhead (headers, PES, PAT/PMT) stays well under 10 % of the payload.
+        // Container overhead (TS: headers, PES, PAT/PMT) stays well under 10 % of the payload.
         out_->reserve(payloadBytes + payloadBytes / 10 + 4096);
         return true;
     }
@@ -246,13 +235,13 @@ class ObjectMuxer {
     // Header, every usable sample merged by decode time with `offset90k` added, trailer.
     bool WriteAll(int64_t offset90k) {
         int rc = avformat_write_header(muxer_.context, nullptr);
-        if (rc < 0) return fail("cannot start the TS object: " + avError(rc));
+        if (rc < 0) return fail("cannot start the " + format_.title + " object: " + avError(rc));
         int64_t pts = 0, dts = 0;
         while (Track* track = nextSample(offset90k, &pts, &dts)) {
             if (!writeSample(*track, pts, dts)) return false;
         }
         rc = av_write_trailer(muxer_.context);
-        if (rc < 0) return fail("cannot finish the TS object: " + avError(rc));
+        if (rc < 0) return fail("cannot finish the " + format_.title + " object: " + avError(rc));
         if (report_->written == 0) return fail("no sample could be written");
         return true;
     }
@@ -270,9 +259,9 @@ class ObjectMuxer {
         std::string why;
         bool described = describeStream(track, parameters.get(), &why);
         if (described && track.kind == TrackDescription::Kind::Audio &&
-            !audioTravelsInTs(track.codec)) {
+            !carriesAudio(format_, track.codec)) {
             described = false;
-            why = std::string(avcodec_get_name(track.codec)) + " cannot travel in MPEG-TS";
+            why = std::string(avcodec_get_name(track.codec)) + " cannot travel in " + format_.title;
         }
         if (!described) {
             if (track.kind != TrackDescription::Kind::Audio) return fail(why);
@@ -362,6 +351,7 @@ class ObjectMuxer {
         return true;
     }
 
+    const SegmentFormat& format_;
     Track tracks_[3];
     Muxer muxer_;
     std::vector<uint8_t>* const out_;
@@ -381,7 +371,7 @@ bool SegmentWriter::Write(const std::vector<StreamData>& video,
     if (!error) error = &localError;
     out->clear();
 
-    ObjectMuxer object(video, audio, meta, out, report, error);
+    ObjectMuxer object(format_, video, audio, meta, out, report, error);
     if (!object.Open() || !object.AddStreams(&audioRefusalLogged_)) return false;
     // The run's origin: the earliest decode time among the first usable samples of the first
     // object lands on kRunOrigin90k. Later objects reuse the same offset.

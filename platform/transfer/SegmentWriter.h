@@ -1,9 +1,10 @@
-// SegmentWriter: turns the samples of one stream file into one MPEG-TS object in memory.
+// SegmentWriter: turns the samples of one stream file into one object of a segment format
+// (MPEG-TS) in memory.
 //
 // One writer serves one run of a transfer object (one connection): every Write opens a fresh
-// libavformat `mpegts` muxer over a custom AVIOContext that appends to the caller's buffer, and
-// every timestamp of the run gets the same constant offset, chosen at the first Write that has
-// samples. Objects are therefore never shifted on their own: written one after the other, or
+// libavformat muxer of its format over a custom AVIOContext that appends to the caller's buffer,
+// and every timestamp of the run gets the same constant offset, chosen at the first Write that
+// has samples. Objects are therefore never shifted on their own: written one after the other, or
 // concatenated, they play as one stream.
 //
 // Sample contract (what the media host puts into the attribute block):
@@ -25,8 +26,8 @@
 // Samples the muxer cannot take are left out and counted instead of failing the whole object:
 // a decode time that does not increase within its track (video, audio) or decreases (meta), a
 // presentation time before the decode time, a time before the run's origin, an empty or
-// oversized payload. Audio whose codec cannot travel in TS is left out of every object (logged
-// once per run).
+// oversized payload. Audio whose codec the format does not carry is left out of every object
+// (logged once per run).
 //
 // Threads: not thread-safe; one thread (the transfer's caller) uses a writer.
 #pragma once
@@ -37,6 +38,7 @@
 #include <vector>
 
 #include "platform/framework/StreamData.h"
+#include "platform/transfer/SegmentFormat.h"
 
 class SegmentWriter {
   public:
@@ -46,7 +48,7 @@ class SegmentWriter {
         size_t dropped = 0;  // samples left out (see the class comment)
     };
 
-    SegmentWriter() = default;
+    explicit SegmentWriter(const SegmentFormat& format = SegmentFormat::Ts()) : format_(format) {}
     SegmentWriter(const SegmentWriter&) = delete;
     SegmentWriter& operator=(const SegmentWriter&) = delete;
 
@@ -67,6 +69,7 @@ class SegmentWriter {
     static constexpr int64_t kRunOrigin90k = 900000;
 
   private:
+    const SegmentFormat& format_;  // a process-wide constant
     bool hasOffset_ = false;
     int64_t offset90k_ = 0;
     bool audioRefusalLogged_ = false;  // the "audio left out" line is written once per run
