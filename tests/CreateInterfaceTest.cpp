@@ -13,11 +13,12 @@ using namespace testsupport;
 namespace {
 
 std::shared_ptr<IFileTransfer> Create(const std::string& endpoint, const std::string& format,
-                                      LogCapture& log) {
+                                      LogCapture& log, const std::string& keyPrefix = "pre/") {
     FrameworkOptions options;
     options.endpoint = endpoint;
     options.segmentFormat = format;
-    options.keyPrefix = "pre/";
+    options.keyPrefix = keyPrefix;
+    options.streamingId = "cam1";
     SetCurrentFrameworkOptions(options);
     log.Clear();
     return VqStreamFileTransfer::CreateInterface();
@@ -66,7 +67,12 @@ TEST(CreateInterfaceTest, ConfigurationsThatCannotWorkGiveNoInterfaceAndSayWhy) 
     for (const auto& record : log.Records())
         EXPECT_EQ(std::string::npos, record.message.find("SECRET")) << record.message;
 
-    EXPECT_TRUE(Create("http://127.0.0.1:9000", "ts", log));
+    // Keys a local directory cannot hold without leaving the bucket; S3 stores them as they are.
+    for (const char* prefix : {"../", "a/./", "/abs/", "a//"}) {
+        EXPECT_FALSE(Create("file:///tmp", "ts", log, prefix)) << prefix;
+        EXPECT_NE(std::string::npos, FailureLine(log).find("cannot hold")) << FailureLine(log);
+    }
+    EXPECT_TRUE(Create("http://127.0.0.1:9000", "ts", log, "../"));
     EXPECT_TRUE(Create("", "ts", log));  // AWS itself
 }
 

@@ -1,5 +1,5 @@
-// The local-directory store: whole objects or none, paths that stay inside the bucket, write
-// errors, cancellation.
+// The local-directory store: whole objects or none, paths that stay inside the bucket (also past
+// symbolic links planted in it), write errors, cancellation.
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <stdlib.h>
@@ -8,10 +8,10 @@
 #include <unistd.h>
 
 #include <atomic>
-#include <filesystem>
 #include <thread>
 
 #include "platform/transfer/LocalDirectoryStore.h"
+#include "tests/support/StoreRoot.h"
 #include "tests/support/TestSupport.h"
 
 using namespace testsupport;
@@ -20,14 +20,6 @@ namespace {
 
 class LocalDirectoryStoreTest : public ::testing::Test {
   protected:
-    static std::string MakeRoot() {
-        char templ[] = "/tmp/sfr-store-XXXXXX";
-        std::string root = mkdtemp(templ);
-        mkdir((root + "/rec").c_str(), 0755);
-        return root;
-    }
-    void TearDown() override { RunProcess({"rm", "-rf", root_}); }
-
     ObjectToStore Object(const std::string& key, const std::string& bytes,
                          const std::string& bucket = "rec") {
         ObjectToStore object;
@@ -40,17 +32,12 @@ class LocalDirectoryStoreTest : public ::testing::Test {
     FileTransferResult Put(const ObjectToStore& object) {
         return store_.Put(object, StoreCredentials(), &info_);
     }
-
-    // Names in a directory (none when it does not exist).
     static std::vector<std::string> Entries(const std::string& directory) {
-        std::vector<std::string> names;
-        std::error_code missing;
-        for (const auto& e : std::filesystem::directory_iterator(directory, missing))
-            names.push_back(e.path().filename().string());
-        return names;
+        return StoreRoot::Entries(directory);
     }
 
-    std::string root_ = MakeRoot();
+    StoreRoot dir_;
+    const std::string root_ = dir_.Root();
     LocalDirectoryStore store_{root_};
     FileTransferInfo info_;
 };
@@ -107,6 +94,15 @@ TEST_F(LocalDirectoryStoreTest, PathsOutsideAnExistingBucketAreFilePathErrors) {
     };
     for (const auto& [bucket, key] : refused)
         EXPECT_EQ(FilePathError, Put(Object(key, "x", bucket))) << bucket << " " << key;
+    // Directories of the key that are symbolic links, to the outside or inside the bucket.
+    StoreRoot outside;
+    ASSERT_EQ(0, symlink(outside.Root().c_str(), (root_ + "/rec/out").c_str()));
+    ASSERT_EQ(0, symlink(".", (root_ + "/rec/in").c_str()));
+    for (const char* key : {"out/a.ts", "out/rec/a.ts", "in/a.ts"})
+        EXPECT_EQ(FilePathError, Put(Object(key, "x"))) << key;
+    EXPECT_EQ(std::vector<std::string>{"rec"}, Entries(outside.Root()));
+    unlink((root_ + "/rec/out").c_str());
+    unlink((root_ + "/rec/in").c_str());
     LocalDirectoryStore noRoot(root_ + "/nowhere");
     EXPECT_EQ(FilePathError, noRoot.Put(Object("a.ts", "x"), StoreCredentials(), &info_));
     // A key part that is a file where a directory must be.

@@ -4,7 +4,6 @@
 #include <stdlib.h>
 
 #include <algorithm>
-#include <filesystem>
 #include <fstream>
 #include <sstream>
 
@@ -13,34 +12,14 @@
 #include "platform/transfer/ObjectKey.h"
 #include "platform/transfer/SegmentTransfer.h"
 #include "tests/support/ClipSamples.h"
+#include "tests/support/StoreRoot.h"
 #include "tests/support/TestSupport.h"
 
 using namespace testsupport;
 
 namespace {
 
-// A fresh store root with the bucket directory "rec"; removed afterwards.
-class StoreDirectory {
-  public:
-    StoreDirectory() {
-        char templ[] = "/tmp/sfr-segment-XXXXXX";
-        root_ = mkdtemp(templ);
-        mkdir((root_ + "/rec").c_str(), 0755);
-    }
-    ~StoreDirectory() { RunProcess({"rm", "-rf", root_}); }
-    const std::string& Root() const { return root_; }
-    std::string Path(const std::string& key) const { return root_ + "/rec/" + key; }
-    // Every regular file under the root, with its path.
-    std::vector<std::string> Files() const {
-        std::vector<std::string> files;
-        for (const auto& entry : std::filesystem::recursive_directory_iterator(root_))
-            if (entry.is_regular_file()) files.push_back(entry.path().string());
-        return files;
-    }
-
-  private:
-    std::string root_;
-};
+using StoreDirectory = StoreRoot;
 
 std::vector<std::string> Lines(const std::string& text) {
     std::vector<std::string> lines;

@@ -11,6 +11,7 @@
 #include "platform/logger/Logger.h"
 #include "platform/transfer/FileTransfer.h"
 #include "platform/transfer/LocalDirectoryStore.h"
+#include "platform/transfer/ObjectKey.h"
 #include "platform/transfer/S3Store.h"
 #include "platform/transfer/SegmentFormat.h"
 #include "platform/transfer/SegmentTransfer.h"
@@ -63,6 +64,29 @@ bool parseFileUrl(const std::string& url, std::string* directory) {
     return true;
 }
 
+// A file URL: a local directory store, when the keys of this stream can stay inside a bucket
+// directory (a key prefix or stream id with "." or ".." parts would lead outside).
+std::shared_ptr<IObjectStore> createLocalStore(const FrameworkOptions& options,
+                                               const SegmentFormat& format) {
+    std::string directory;
+    if (!startsWithNoCase(options.endpoint, "file://") ||
+        !parseFileUrl(options.endpoint, &directory)) {
+        Logger::Put(4, kFile, kFunction, __LINE__,
+                    "endpoint \"%s\" is not a usable file URL (file:///absolute/directory)",
+                    withoutUserInfo(options.endpoint).c_str());
+        return nullptr;
+    }
+    std::string why;
+    const std::string key =
+        ObjectKey(options.keyPrefix, options.streamingId, 1, 0, format.extension);
+    if (!LocalDirectoryStore::ValidKey(key, why)) {
+        Logger::Put(4, kFile, kFunction, __LINE__,
+                    "a local directory cannot hold the keys of this stream: %s", why.c_str());
+        return nullptr;
+    }
+    return std::make_shared<LocalDirectoryStore>(directory);
+}
+
 // Any endpoint that is not a file URL: an S3 store ("" means AWS itself).
 std::shared_ptr<IObjectStore> createS3Store(const FrameworkOptions& options) {
     S3StoreConfig config;
@@ -86,20 +110,9 @@ std::shared_ptr<IFileTransfer> VqStreamFileTransfer::CreateInterface() {
                     options.segmentFormat.c_str(), SegmentFormat::Names().c_str());
         return nullptr;
     }
-    std::shared_ptr<IObjectStore> store;
-    if (startsWithNoCase(options.endpoint, "file:")) {
-        std::string directory;
-        if (!startsWithNoCase(options.endpoint, "file://") ||
-            !parseFileUrl(options.endpoint, &directory)) {
-            Logger::Put(4, kFile, kFunction, __LINE__,
-                        "endpoint \"%s\" is not a usable file URL (file:///absolute/directory)",
-                        withoutUserInfo(options.endpoint).c_str());
-            return nullptr;
-        }
-        store = std::make_shared<LocalDirectoryStore>(directory);
-    } else {
-        store = createS3Store(options);
-        if (!store) return nullptr;
-    }
+    std::shared_ptr<IObjectStore> store = startsWithNoCase(options.endpoint, "file:")
+                                              ? createLocalStore(options, *format)
+                                              : createS3Store(options);
+    if (!store) return nullptr;
     return std::make_shared<SegmentTransfer>(store, options.keyPrefix, *format);
 }

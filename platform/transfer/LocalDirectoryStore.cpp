@@ -6,10 +6,10 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
 #include <chrono>
 #include <cstring>
 #include <random>
-#include <vector>
 
 #include "platform/logger/Logger.h"
 
@@ -18,6 +18,35 @@ namespace {
 constexpr const char* kFile = "platform/transfer/LocalDirectoryStore";
 constexpr const char* kFunction = "LocalDirectoryStore::Put";
 constexpr size_t kChunk = 1 << 20;  // bytes per write between checks for Cancel
+
+// Closes a file descriptor when it goes out of scope.
+class Fd {
+  public:
+    explicit Fd(int fd = -1) : fd_(fd) {}
+    ~Fd() { Reset(-1); }
+    Fd(const Fd&) = delete;
+    Fd& operator=(const Fd&) = delete;
+    int Get() const { return fd_; }
+    void Reset(int fd) {
+        if (fd_ >= 0) close(fd_);
+        fd_ = fd;
+    }
+    // Gives the descriptor away.
+    int Release() {
+        int fd = fd_;
+        fd_ = -1;
+        return fd;
+    }
+    // Closes now; the result of close().
+    int Close() {
+        int rc = close(fd_);
+        fd_ = -1;
+        return rc;
+    }
+
+  private:
+    int fd_;
+};
 
 // Splits a key into its '/'-separated parts; false when a part is empty, "." or "..", or the
 // name holds a NUL byte: such a key could leave the bucket directory or name a directory.
@@ -34,112 +63,190 @@ bool splitKey(const std::string& key, std::vector<std::string>* parts) {
     }
 }
 
-// A unique temporary name in `directory`: hidden, and without the extension that ends every
-// key the transfer writes.
-std::string temporaryName(const std::string& directory) {
-    static std::atomic<unsigned> counter{0};
-    thread_local std::mt19937_64 random{std::random_device{}()};
-    return directory + "/.sfr-upload-" + std::to_string(getpid()) + "-" +
-           std::to_string(counter++) + "-" + std::to_string(random() % 1000000000);
+// Errors of the file system that may pass by themselves.
+bool transient(int error) {
+    switch (error) {
+        case EIO:
+        case ENOSPC:
+        case EDQUOT:
+        case EMFILE:
+        case ENFILE:
+        case ENOMEM:
+        case EAGAIN:
+        case EBUSY:
+            return true;
+        default:
+            return false;
+    }
 }
 
-void syncDirectory(const std::string& directory) {
-    int fd = open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
-    if (fd < 0) return;
-    fsync(fd);  // best effort: the object itself is already on disk
-    close(fd);
+// An attempt that failed with `error` (an errno), as InternalError.
+AttemptOutcome failedWith(int error) {
+    return {InternalError, transient(error)};
+}
+
+// A unique hidden temporary name, without the extension that ends every key the transfer writes.
+std::string temporaryName() {
+    static std::atomic<unsigned> counter{0};
+    thread_local std::mt19937_64 random{std::random_device{}()};
+    return ".sfr-upload-" + std::to_string(getpid()) + "-" + std::to_string(counter++) + "-" +
+           std::to_string(random() % 1000000000);
+}
+
+// Opens (creating when missing) the directory `name` in `parent` without following a symbolic
+// link; `path` is its path for log lines.
+AttemptOutcome openSubdirectory(int parent, const std::string& name, const std::string& path,
+                                Fd& out) {
+    const int flags = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
+    int fd = openat(parent, name.c_str(), flags);
+    if (fd < 0 && errno == ENOENT && (mkdirat(parent, name.c_str(), 0755) == 0 || errno == EEXIST))
+        fd = openat(parent, name.c_str(), flags);
+    if (fd >= 0) {
+        out.Reset(fd);
+        return {Success, false};
+    }
+    const int error = errno;
+    struct stat st {};
+    if ((error == ELOOP || error == ENOTDIR) &&
+        fstatat(parent, name.c_str(), &st, AT_SYMLINK_NOFOLLOW) == 0) {
+        Logger::Put(5, kFile, kFunction, __LINE__, "%s is %s", path.c_str(),
+                    S_ISLNK(st.st_mode) ? "a symbolic link" : "not a directory");
+        return {FilePathError, false};
+    }
+    Logger::Put(5, kFile, kFunction, __LINE__, "cannot create %s: %s", path.c_str(),
+                std::strerror(error));
+    return error == ENOTDIR ? AttemptOutcome{FilePathError, false} : failedWith(error);
+}
+
+// Writes all of `data` to `fd`; stops early (false, errno 0) when `cancel` is raised.
+bool writeAll(int fd, const uint8_t* data, size_t size, const CancelSignal& cancel) {
+    size_t done = 0;
+    while (done < size) {
+        if (cancel.Raised()) {
+            errno = 0;
+            return false;
+        }
+        ssize_t n = write(fd, data + done, std::min(kChunk, size - done));
+        if (n < 0 && errno == EINTR) continue;
+        if (n <= 0) {
+            if (n == 0) errno = ENOSPC;
+            return false;
+        }
+        done += static_cast<size_t>(n);
+    }
+    return true;
+}
+
+// Fills the temporary file `temporary` (open in `file`) in the directory `dir` with the object,
+// flushes it and renames it to `name`. Leaves no temporary file behind when it fails.
+AttemptOutcome fillAndRename(int dir, Fd& file, const std::string& temporary,
+                             const std::string& name, const std::string& path,
+                             const ObjectToStore& object, const CancelSignal& cancel) {
+    auto abandon = [&](AttemptOutcome outcome, const char* what, int error) {
+        if (error != 0)
+            Logger::Put(5, kFile, kFunction, __LINE__, "cannot %s %s: %s", what, path.c_str(),
+                        std::strerror(error));
+        file.Reset(-1);
+        unlinkat(dir, temporary.c_str(), 0);
+        return outcome;
+    };
+    if (!writeAll(file.Get(), object.data, object.size, cancel)) {
+        const int error = errno;
+        return abandon(error == 0 ? AttemptOutcome{TimeOut, false} : failedWith(error), "write",
+                       error);
+    }
+    if (fsync(file.Get()) != 0) return abandon(failedWith(errno), "flush", errno);
+    if (file.Close() != 0) return abandon(failedWith(errno), "close", errno);
+    if (cancel.Raised()) return abandon({TimeOut, false}, "write", 0);
+    if (renameat(dir, temporary.c_str(), dir, name.c_str()) != 0) {
+        const int error = errno;
+        return abandon(error == EISDIR ? AttemptOutcome{FilePathError, false} : failedWith(error),
+                       "rename into", error);
+    }
+    fsync(dir);  // best effort: the object itself is already on disk
+    Logger::Put(13, kFile, kFunction, __LINE__, "stored %s (%zu bytes)", path.c_str(), object.size);
+    return {Success, false};
 }
 
 }  // namespace
 
-LocalDirectoryStore::LocalDirectoryStore(std::string root) : root_(std::move(root)) {}
+LocalDirectoryStore::LocalDirectoryStore(std::string root, RetryPolicy retry)
+    : root_(std::move(root)), retry_(retry) {}
 
 void LocalDirectoryStore::Cancel() {
-    cancelled_ = true;
+    cancel_.Raise();
+}
+
+bool LocalDirectoryStore::ValidKey(const std::string& key, std::string& why) {
+    std::vector<std::string> parts;
+    if (splitKey(key, &parts)) return true;
+    why = "key \"" + key + "\" has an empty, \".\" or \"..\" part, or a NUL byte";
+    return false;
 }
 
 FileTransferResult LocalDirectoryStore::Put(const ObjectToStore& object,
                                             const StoreCredentials& /*credentials*/,
                                             FileTransferInfo* info) {
     const auto start = std::chrono::steady_clock::now();
-    auto finish = [&](FileTransferResult result, uint64_t size) {
-        if (info) {
-            info->fileSize = size;
-            info->responseTime =
-                static_cast<uint32_t>(std::chrono::duration_cast<std::chrono::milliseconds>(
-                                          std::chrono::steady_clock::now() - start)
-                                          .count());
-        }
-        return result;
-    };
-    if (cancelled_) return finish(TimeOut, 0);
+    const FileTransferResult result = store(object);
+    if (info) {
+        info->fileSize = result == Success ? object.size : 0;
+        info->responseTime =
+            static_cast<uint32_t>(std::chrono::duration_cast<std::chrono::milliseconds>(
+                                      std::chrono::steady_clock::now() - start)
+                                      .count());
+    }
+    return result;
+}
 
+FileTransferResult LocalDirectoryStore::store(const ObjectToStore& object) {
+    if (cancel_.Raised()) return TimeOut;
     std::vector<std::string> parts;
     if (object.bucket.empty() || object.bucket.find('/') != std::string::npos ||
         object.bucket == "." || object.bucket == ".." || !splitKey(object.key, &parts)) {
         Logger::Put(5, kFile, kFunction, __LINE__, "not a storable bucket/key: \"%s\" \"%s\"",
                     object.bucket.c_str(), object.key.c_str());
-        return finish(FilePathError, 0);
+        return FilePathError;
     }
+    return RunAttempts(retry_, cancel_, [&] { return writeOnce(object, parts); });
+}
+
+AttemptOutcome LocalDirectoryStore::writeOnce(const ObjectToStore& object,
+                                              const std::vector<std::string>& parts) {
     std::string directory = root_ + "/" + object.bucket;
-    struct stat st {};
-    if (stat(directory.c_str(), &st) != 0 || !S_ISDIR(st.st_mode)) {
+    Fd dir(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    if (dir.Get() < 0) {
+        const int error = errno;
+        if (error != ENOENT && error != ENOTDIR) {
+            Logger::Put(5, kFile, kFunction, __LINE__, "cannot open %s: %s", directory.c_str(),
+                        std::strerror(error));
+            return failedWith(error);
+        }
         Logger::Put(5, kFile, kFunction, __LINE__, "bucket directory %s does not exist",
                     directory.c_str());
-        return finish(FilePathError, 0);
+        return {FilePathError, false};
     }
     for (size_t i = 0; i + 1 < parts.size(); ++i) {
         directory += "/" + parts[i];
-        if (mkdir(directory.c_str(), 0755) == 0 || errno == EEXIST) {
-            if (stat(directory.c_str(), &st) == 0 && S_ISDIR(st.st_mode)) continue;
-            Logger::Put(5, kFile, kFunction, __LINE__, "%s is not a directory", directory.c_str());
-            return finish(FilePathError, 0);
-        }
-        Logger::Put(5, kFile, kFunction, __LINE__, "cannot create %s: %s", directory.c_str(),
-                    std::strerror(errno));
-        return finish(errno == ENOTDIR ? FilePathError : InternalError, 0);
+        Fd sub;
+        const AttemptOutcome opened = openSubdirectory(dir.Get(), parts[i], directory, sub);
+        if (opened.result != Success) return opened;
+        dir.Reset(sub.Release());
     }
-    const std::string finalPath = directory + "/" + parts.back();
-
     std::string temporary;
-    int fd = -1;
-    for (int attempt = 0; fd < 0 && attempt < 16; ++attempt) {
-        temporary = temporaryName(directory);
-        fd = open(temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0644);
-        if (fd < 0 && errno != EEXIST) break;
+    Fd file;
+    for (int tries = 0; file.Get() < 0 && tries < 16; ++tries) {
+        temporary = temporaryName();
+        file.Reset(openat(dir.Get(), temporary.c_str(),
+                          O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC | O_NOFOLLOW, 0644));
+        if (file.Get() < 0 && errno != EEXIST) break;
     }
-    if (fd < 0) {
+    if (file.Get() < 0) {
+        const int error = errno;
         Logger::Put(5, kFile, kFunction, __LINE__, "cannot create a file in %s: %s",
-                    directory.c_str(), std::strerror(errno));
-        return finish(InternalError, 0);
+                    directory.c_str(), std::strerror(error));
+        return failedWith(error);
     }
-    auto abandon = [&](FileTransferResult result, const char* what, int error) {
-        if (error != 0)
-            Logger::Put(5, kFile, kFunction, __LINE__, "cannot %s %s: %s", what, finalPath.c_str(),
-                        std::strerror(error));
-        if (fd >= 0) close(fd);
-        unlink(temporary.c_str());
-        return finish(result, 0);
-    };
-
-    size_t done = 0;
-    while (done < object.size) {
-        if (cancelled_) return abandon(TimeOut, "write", 0);
-        size_t chunk = std::min(kChunk, object.size - done);
-        ssize_t n = write(fd, object.data + done, chunk);
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) return abandon(InternalError, "write", n < 0 ? errno : ENOSPC);
-        done += static_cast<size_t>(n);
-    }
-    if (fsync(fd) != 0) return abandon(InternalError, "flush", errno);
-    int closed = close(fd);
-    fd = -1;
-    if (closed != 0) return abandon(InternalError, "close", errno);
-    if (cancelled_) return abandon(TimeOut, "write", 0);
-    if (rename(temporary.c_str(), finalPath.c_str()) != 0)
-        return abandon(errno == EISDIR ? FilePathError : InternalError, "rename into", errno);
-    syncDirectory(directory);
-    Logger::Put(13, kFile, kFunction, __LINE__, "stored %s (%zu bytes)", finalPath.c_str(),
-                object.size);
-    return finish(Success, object.size);
+    return fillAndRename(dir.Get(), file, temporary, parts.back(), directory + "/" + parts.back(),
+                         object, cancel_);
 }

@@ -34,18 +34,24 @@ void AddMetadata(const ObjectToStore& object, SigV4Request& request) {
 
 }  // namespace
 
-S3PutRequest SignS3Put(const S3Target& target, const ObjectToStore& object,
-                       const StoreCredentials& credentials, const std::string& amzDate) {
-    S3PutRequest out;
+S3Payload DigestS3Payload(const ObjectToStore& object) {
+    S3Payload payload;
     const digest::Md5 md5 = digest::Md5Of(object.data, object.size);
-    out.md5Hex = digest::Hex(md5);
+    payload.md5Base64 = digest::Base64(md5);
+    payload.md5Hex = digest::Hex(md5);
+    payload.sha256Hex = digest::Hex(digest::Sha256Of(object.data, object.size));
+    return payload;
+}
 
+S3PutRequest SignS3Put(const S3Target& target, const ObjectToStore& object,
+                       const StoreCredentials& credentials, const S3Payload& payload,
+                       const std::string& amzDate) {
     SigV4Request request;
     request.method = "PUT";
     request.canonicalUri = target.canonicalUri;
-    request.payloadHash = digest::Hex(digest::Sha256Of(object.data, object.size));
+    request.payloadHash = payload.sha256Hex;
     request.headers = {{"host", target.host},
-                       {"content-md5", digest::Base64(md5)},
+                       {"content-md5", payload.md5Base64},
                        {"content-type", HeaderValue(object.contentType)},
                        {"x-amz-content-sha256", request.payloadHash},
                        {"x-amz-date", amzDate}};
@@ -55,6 +61,7 @@ S3PutRequest SignS3Put(const S3Target& target, const ObjectToStore& object,
 
     const SigV4Key key{credentials.accessKey, credentials.secretKey, target.signingRegion, "s3"};
     const SigV4Signature signature = SigV4Signer::Sign(request, key, amzDate);
+    S3PutRequest out;
     out.headers = std::move(request.headers);
     out.authorization = signature.authorization;
     out.signature = signature.signature;

@@ -1,7 +1,8 @@
 // S3PutRequest: the header lines of one S3 PUT of an object, signed with AWS Signature V4.
 //
-// SignS3Put is a pure function of the target, the object, the credentials and the signing
-// time; safe from any thread. Every value is sent in the form it was signed in, and no value
+// DigestS3Payload hashes the body once per object; SignS3Put, a pure function of the target,
+// the object, the credentials, the digests and the signing time, signs each attempt anew. Both
+// are safe from any thread. Every value is sent in the form it was signed in, and no value
 // carries a line break or another control character (such a value would add a header of its
 // own), so any server signs exactly what it received.
 //
@@ -17,14 +18,24 @@
 #include "platform/transfer/ObjectStore.h"
 #include "platform/transfer/S3Target.h"
 
+// The body's digests, as the request carries them.
+struct S3Payload {
+    std::string md5Base64;  // Content-MD5
+    std::string md5Hex;     // to compare with the ETag of the answer
+    std::string sha256Hex;  // x-amz-content-sha256: the body's SHA-256 in lower-case hex
+};
+
+S3Payload DigestS3Payload(const ObjectToStore& object);
+
 struct S3PutRequest {
     // Every signed header, names in lower case, values as sent.
     std::vector<std::pair<std::string, std::string>> headers;
     std::string authorization;  // the Authorization header value; never log it
     std::string signature;      // its hex signature, to keep it out of log lines
-    std::string md5Hex;         // the body's MD5, to compare with the ETag of the answer
 };
 
-// Signs the PUT of `object` to `target` at `amzDate` ("YYYYMMDDTHHMMSSZ").
+// Signs the PUT of `object`, whose digests are `payload`, to `target` at `amzDate`
+// ("YYYYMMDDTHHMMSSZ").
 S3PutRequest SignS3Put(const S3Target& target, const ObjectToStore& object,
-                       const StoreCredentials& credentials, const std::string& amzDate);
+                       const StoreCredentials& credentials, const S3Payload& payload,
+                       const std::string& amzDate);

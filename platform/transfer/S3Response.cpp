@@ -42,6 +42,24 @@ FileTransferResult ClassifyS3Answer(long status, const std::string& code) {
     return InternalError;
 }
 
+bool RetryableS3Answer(long status, const std::string& code) {
+    static const std::set<std::string> kPassing = {"SlowDown",
+                                                   "RequestTimeout",
+                                                   "InternalError",
+                                                   "ServiceUnavailable",
+                                                   "Throttling",
+                                                   "ThrottlingException",
+                                                   "RequestThrottled",
+                                                   "RequestLimitExceeded",
+                                                   "BandwidthLimitExceeded",
+                                                   "TooManyRequests",
+                                                   "TooManyRequestsException",
+                                                   "RequestTimeoutException",
+                                                   "PriorRequestNotComplete"};
+    if (kPassing.count(code)) return true;
+    return status == 429 || status == 500 || status == 502 || status == 503 || status == 504;
+}
+
 bool EtagMatches(const std::string& etag, const std::string& md5Hex) {
     std::string value = etag;
     if (value.size() >= 2 && value.front() == '"' && value.back() == '"') {

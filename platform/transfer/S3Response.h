@@ -26,6 +26,11 @@ struct S3Response {
 // else by the status. 2xx is Success (the caller still checks the ETag).
 FileTransferResult ClassifyS3Answer(long status, const std::string& code);
 
+// Whether an answer that is not a success may pass by itself, so that the same request can be
+// sent again: a 5xx or 429 status, or a throttling or timeout Code (SlowDown, RequestTimeout,
+// InternalError, ServiceUnavailable, Throttling ...).
+bool RetryableS3Answer(long status, const std::string& code);
+
 // True when `etag` (quoted or not, any case) is the hex MD5 `md5Hex`.
 bool EtagMatches(const std::string& etag, const std::string& md5Hex);
 

@@ -127,6 +127,27 @@ FileTransferResult ClassifyCurlError(CURLcode code) {
     }
 }
 
+// Failures that may pass by themselves: the connection could not be made or broke, or the
+// server was too slow. Not a certificate that does not verify, nor a body curl cannot resend.
+bool RetryableCurlError(CURLcode code) {
+    switch (code) {
+        case CURLE_OPERATION_TIMEDOUT:
+        case CURLE_COULDNT_RESOLVE_PROXY:
+        case CURLE_COULDNT_RESOLVE_HOST:
+        case CURLE_COULDNT_CONNECT:
+        case CURLE_SEND_ERROR:
+        case CURLE_RECV_ERROR:
+        case CURLE_GOT_NOTHING:
+        case CURLE_PARTIAL_FILE:
+        case CURLE_SSL_CONNECT_ERROR:
+        case CURLE_HTTP2:
+        case CURLE_HTTP2_STREAM:
+            return true;
+        default:
+            return false;
+    }
+}
+
 // "[v6]:port" into "[v6]" and "port" (empty when absent).
 bool SplitIpv6Authority(const std::string& authority, std::string& host, std::string& port,
                         std::string& why) {
@@ -222,16 +243,17 @@ void SetUpEasy(CURL* easy, const std::string& url, const S3StoreConfig& config, 
     curl_easy_setopt(easy, CURLOPT_LOW_SPEED_LIMIT, config.lowSpeedLimit);
     curl_easy_setopt(easy, CURLOPT_LOW_SPEED_TIME, config.lowSpeedTimeS);
     curl_easy_setopt(easy, CURLOPT_TCP_KEEPALIVE, 1L);
+    // The key goes as signed: "." and ".." parts are part of the key, not steps in a path.
+    curl_easy_setopt(easy, CURLOPT_PATH_AS_IS, 1L);
 }
 
 // Drives `easy` on `multi` until it is done, the multi interface fails, or `cancelled` is set;
 // records which in `exchange`.
-void RunToCompletion(CURLM* multi, CURL* easy, const std::atomic<bool>& cancelled,
-                     S3Exchange& exchange) {
+void RunToCompletion(CURLM* multi, CURL* easy, const CancelSignal& cancel, S3Exchange& exchange) {
     bool finished = false;
     exchange.multiCode = curl_multi_add_handle(multi, easy);
     while (exchange.multiCode == CURLM_OK && !finished) {
-        if (cancelled.load()) {
+        if (cancel.Raised()) {
             exchange.cancelled = true;
             return;
         }
@@ -300,7 +322,7 @@ S3Store::~S3Store() {
 }
 
 void S3Store::Cancel() {
-    cancelled_.store(true);
+    cancel_.Raise();
     // Wakes a Put that waits in curl_multi_poll; a Put that is not waiting yet finds the
     // wake-up pending (or the flag set) before it waits.
     if (multi_ != nullptr) curl_multi_wakeup(static_cast<CURLM*>(multi_));
@@ -313,24 +335,36 @@ FileTransferResult S3Store::Put(const ObjectToStore& object, const StoreCredenti
     info->fileSize = 0;
     info->responseTime = 0;
 
-    if (cancelled_.load()) return TimeOut;
+    if (cancel_.Raised()) return TimeOut;
     S3Target target;
     const FileTransferResult refusal = checkSendable(object, credentials, target);
     if (refusal != Success) return refusal;
+    const S3Payload payload = DigestS3Payload(object);
+    const auto started = std::chrono::steady_clock::now();
+    const FileTransferResult result = RunAttempts(
+        config_.retry, cancel_, [&] { return attempt(target, object, credentials, payload); });
+    info->responseTime =
+        static_cast<uint32_t>(std::chrono::duration_cast<std::chrono::milliseconds>(
+                                  std::chrono::steady_clock::now() - started)
+                                  .count());
+    if (result == Success) info->fileSize = object.size;
+    return result;
+}
+
+AttemptOutcome S3Store::attempt(const S3Target& target, const ObjectToStore& object,
+                                const StoreCredentials& credentials, const S3Payload& payload) {
+    // Signed anew: the signature covers the time of sending.
     const S3PutRequest request =
-        SignS3Put(target, object, credentials, SigV4Signer::AmzDate(signer_.Now()));
+        SignS3Put(target, object, credentials, payload, SigV4Signer::AmzDate(signer_.Now()));
     S3Exchange exchange;
     if (!perform(target.url, request, object, exchange)) {
         Logger::Put(4, kFile, kPut, __LINE__, "PUT %s/%s not sent: out of memory",
                     object.bucket.c_str(), object.key.c_str());
-        return InternalError;
+        return {InternalError, false};
     }
-    info->responseTime = exchange.responseTimeMs;
     const std::vector<std::string> secrets = {credentials.secretKey, credentials.sessionToken,
                                               request.signature};
-    const FileTransferResult result = interpret(exchange, object, request.md5Hex, secrets);
-    if (result == Success) info->fileSize = object.size;
-    return result;
+    return interpret(exchange, object, payload.md5Hex, secrets);
 }
 
 FileTransferResult S3Store::checkSendable(const ObjectToStore& object,
@@ -345,13 +379,20 @@ FileTransferResult S3Store::checkSendable(const ObjectToStore& object,
                     object.bucket.c_str(), object.key.c_str());
         return InternalError;
     }
+    // The region and the keys come with the credentials, and new ones may be usable: what is
+    // wrong with them is an AuthenticationError, which makes the recorder ask for new ones.
     std::string why;
-    if (!S3TargetFor(endpoint_, object.bucket, object.key, credentials, target, why)) {
-        // A region comes with the credentials, and new ones may bring a usable one.
-        bool region = why.find("region") != std::string::npos;
+    if (!ValidateCredentialText(credentials, why) ||
+        (!credentials.region.empty() &&
+         !ValidateRegion(credentials.region, endpoint_.empty(), why))) {
         Logger::Put(5, kFile, kPut, __LINE__, "PUT \"%s/%s\" not sent: %s", object.bucket.c_str(),
                     object.key.c_str(), why.c_str());
-        return region ? AuthenticationError : FilePathError;
+        return AuthenticationError;
+    }
+    if (!S3TargetFor(endpoint_, object.bucket, object.key, credentials, target, why)) {
+        Logger::Put(5, kFile, kPut, __LINE__, "PUT \"%s/%s\" not sent: %s", object.bucket.c_str(),
+                    object.key.c_str(), why.c_str());
+        return FilePathError;
     }
     return Success;
 }
@@ -379,7 +420,7 @@ bool S3Store::perform(const std::string& url, const S3PutRequest& request,
     // Cancel's curl_multi_wakeup needs attention.
     CURLM* multi = static_cast<CURLM*>(multi_);
     const auto started = std::chrono::steady_clock::now();
-    RunToCompletion(multi, easy, cancelled_, exchange);
+    RunToCompletion(multi, easy, cancel_, exchange);
     exchange.responseTimeMs =
         static_cast<uint32_t>(std::chrono::duration_cast<std::chrono::milliseconds>(
                                   std::chrono::steady_clock::now() - started)
@@ -393,19 +434,19 @@ bool S3Store::perform(const std::string& url, const S3PutRequest& request,
     return true;
 }
 
-FileTransferResult S3Store::interpret(const S3Exchange& exchange, const ObjectToStore& object,
-                                      const std::string& md5Hex,
-                                      const std::vector<std::string>& secrets) {
+AttemptOutcome S3Store::interpret(const S3Exchange& exchange, const ObjectToStore& object,
+                                  const std::string& md5Hex,
+                                  const std::vector<std::string>& secrets) {
     const std::string where = object.bucket + "/" + object.key;
     if (exchange.cancelled) {
         Logger::Put(5, kFile, kPut, __LINE__, "PUT %s cancelled after %u ms", where.c_str(),
                     exchange.responseTimeMs);
-        return TimeOut;
+        return {TimeOut, false};
     }
     if (exchange.multiCode != CURLM_OK) {
         Logger::Put(4, kFile, kPut, __LINE__, "PUT %s: curl multi error %d", where.c_str(),
                     static_cast<int>(exchange.multiCode));
-        return InternalError;
+        return {InternalError, false};
     }
     if (exchange.transferCode != CURLE_OK) {
         FileTransferResult result = ClassifyCurlError(exchange.transferCode);
@@ -413,12 +454,12 @@ FileTransferResult S3Store::interpret(const S3Exchange& exchange, const ObjectTo
                     where.c_str(), exchange.responseTimeMs,
                     Redact(exchange.curlError, secrets).c_str(),
                     static_cast<int>(exchange.transferCode), static_cast<unsigned>(result));
-        return result;
+        return {result, RetryableCurlError(exchange.transferCode)};
     }
     const S3Response& response = exchange.response;
     const std::string code = response.XmlElement("Code");
     FileTransferResult result = ClassifyS3Answer(response.status, code);
-    if (result == Success) return checkStored(exchange, where, object.size, md5Hex);
+    if (result == Success) return {checkStored(exchange, where, object.size, md5Hex), false};
 
     std::string message = Redact(Printable(response.XmlElement("Message")), secrets);
     std::string requestId = Printable(response.requestId);
@@ -427,7 +468,7 @@ FileTransferResult S3Store::interpret(const S3Exchange& exchange, const ObjectTo
                 response.status, Printable(code).c_str(), message.c_str(), requestId.c_str(),
                 static_cast<unsigned>(result));
     if (result == RequestTimeTooSkewed) correctClock(response);
-    return result;
+    return {result, RetryableS3Answer(response.status, code)};
 }
 
 FileTransferResult S3Store::checkStored(const S3Exchange& exchange, const std::string& where,

@@ -11,14 +11,15 @@ constexpr const char* kFunction = "SegmentTransfer::Transfer";
 }  // namespace
 
 SegmentTransfer::SegmentTransfer(std::shared_ptr<IObjectStore> store, std::string keyPrefix,
-                                 const SegmentFormat& format)
+                                 const SegmentFormat& format, RetryPolicy pacing)
     : store_(std::move(store)),
       keyPrefix_(std::move(keyPrefix)),
       format_(format),
-      writer_(format) {}
+      writer_(format),
+      floor_(pacing) {}
 
 void SegmentTransfer::Cancel() {
-    cancelled_ = true;
+    cancel_.Raise();
     if (store_) store_->Cancel();
 }
 
@@ -28,7 +29,7 @@ FileTransferResult SegmentTransfer::Transfer(const FileTransferRequest& request,
     if (!info) info = &localInfo;
     info->fileSize = 0;
     info->responseTime = 0;
-    if (cancelled_) return TimeOut;
+    if (cancel_.Raised()) return TimeOut;
     if (!store_) return OtherError;
 
     if (request.video.empty() && request.audio.empty() && request.meta.empty()) {
@@ -36,6 +37,15 @@ FileTransferResult SegmentTransfer::Transfer(const FileTransferRequest& request,
                     "stream file %" PRId64 " of %s has no samples: no object",
                     request.sequenceNumber, request.streamingId.c_str());
         return Success;
+    }
+    const auto wait = floor_.Remaining(std::chrono::steady_clock::now());
+    if (wait.count() > 0) {
+        Logger::Put(13, kFile, kFunction, __LINE__,
+                    "stream file %" PRId64 " waits %lld ms after failed transfers",
+                    request.sequenceNumber,
+                    static_cast<long long>(
+                        std::chrono::duration_cast<std::chrono::milliseconds>(wait).count()));
+        if (!cancel_.Wait(wait)) return TimeOut;
     }
 
     StoredObject event;
@@ -48,6 +58,7 @@ FileTransferResult SegmentTransfer::Transfer(const FileTransferRequest& request,
     event.key = ObjectKey(keyPrefix_, request.streamingId, request.sequenceNumber,
                           event.captureMicros, format_.extension);
     event.result = writeAndStore(request, event, info);
+    floor_.Record(event.result == Success, std::chrono::steady_clock::now());
     event.size = info->fileSize;
     event.responseTimeMs = info->responseTime;
     ObjectEvents::Publish(event);

@@ -5,6 +5,10 @@
 // ObjectEvents event. One object serves one connection of the recorder: the writer's timeline
 // offset is fixed by its first object, so the objects of one connection are continuous.
 //
+// After a failed transfer the next one waits for the failure floor of RetryPolicy (a delay that
+// doubles with each failure in a row and ends at once on Cancel), so that a store that keeps
+// refusing, or a stream file the writer cannot take, is not tried in a tight loop.
+//
 // Results beyond the store's own: a request without samples (a gap) stores nothing, publishes
 // nothing and is a Success with fileSize 0; samples the writer cannot turn into an object give
 // FileBroken; after Cancel every Transfer returns TimeOut. Credentials go to the store only and
@@ -14,7 +18,6 @@
 // come from any thread meanwhile and is forwarded to the store, which ends a running Put.
 #pragma once
 
-#include <atomic>
 #include <cstdint>
 #include <memory>
 #include <string>
@@ -23,6 +26,7 @@
 #include "platform/transfer/FileTransfer.h"
 #include "platform/transfer/ObjectEvents.h"
 #include "platform/transfer/ObjectStore.h"
+#include "platform/transfer/RetryPacing.h"
 #include "platform/transfer/SegmentFormat.h"
 #include "platform/transfer/SegmentWriter.h"
 
@@ -30,7 +34,8 @@ class SegmentTransfer : public IFileTransfer {
   public:
     // `keyPrefix` is put in front of every object key as it is (no separator added).
     SegmentTransfer(std::shared_ptr<IObjectStore> store, std::string keyPrefix,
-                    const SegmentFormat& format = SegmentFormat::Ts());
+                    const SegmentFormat& format = SegmentFormat::Ts(),
+                    RetryPolicy pacing = RetryPolicy());
 
     FileTransferResult Transfer(const FileTransferRequest& request,
                                 FileTransferInfo* info) override;
@@ -46,5 +51,6 @@ class SegmentTransfer : public IFileTransfer {
     const SegmentFormat& format_;  // a process-wide constant
     SegmentWriter writer_;         // used by Transfer only
     std::vector<uint8_t> object_;  // the last object written; its capacity is reused
-    std::atomic<bool> cancelled_{false};
+    FailureFloor floor_;           // used by Transfer only
+    CancelSignal cancel_;          // raised by Cancel
 };
