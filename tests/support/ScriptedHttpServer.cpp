@@ -3,6 +3,7 @@
 #include <arpa/inet.h>
 #include <netinet/in.h>
 #include <poll.h>
+#include <strings.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -10,8 +11,42 @@
 
 namespace testsupport {
 
+namespace {
+
+// The value of header `name` in a header block, "" when absent.
+std::string HeaderIn(const std::string& head, const std::string& name) {
+    size_t at = head.find("\r\n");
+    while (at != std::string::npos && at + 2 < head.size()) {
+        size_t start = at + 2, end = head.find("\r\n", start);
+        if (end == std::string::npos) end = head.size();
+        const std::string line = head.substr(start, end - start);
+        size_t colon = line.find(':');
+        if (colon == name.size() && strncasecmp(line.c_str(), name.c_str(), colon) == 0) {
+            size_t value = line.find_first_not_of(" \t", colon + 1);
+            return value == std::string::npos ? "" : line.substr(value);
+        }
+        at = end;
+    }
+    return "";
+}
+
+}  // namespace
+
+std::string HttpRequestSeen::Header(const std::string& name) const {
+    return HeaderIn(raw.substr(0, raw.find("\r\n\r\n")), name);
+}
+
 ScriptedHttpServer::ScriptedHttpServer(Mode mode, std::string response)
-    : mode_(mode), response_(std::move(response)) {
+    : mode_(mode), handler_([response](const HttpRequestSeen&) { return response; }) {
+    Start();
+}
+
+ScriptedHttpServer::ScriptedHttpServer(Handler handler)
+    : mode_(Mode::kRespond), handler_(std::move(handler)) {
+    Start();
+}
+
+void ScriptedHttpServer::Start() {
     listen_ = socket(AF_INET, SOCK_STREAM, 0);
     sockaddr_in address{};
     address.sin_family = AF_INET;
@@ -36,7 +71,12 @@ ScriptedHttpServer::~ScriptedHttpServer() {
 
 std::string ScriptedHttpServer::Request() const {
     std::lock_guard<std::mutex> lock(mutex_);
-    return request_;
+    return requests_.empty() ? std::string() : requests_.back().raw;
+}
+
+std::vector<HttpRequestSeen> ScriptedHttpServer::Requests() const {
+    std::lock_guard<std::mutex> lock(mutex_);
+    return requests_;
 }
 
 void ScriptedHttpServer::Run() {
@@ -63,24 +103,32 @@ void ScriptedHttpServer::Run() {
 void ScriptedHttpServer::Answer(int fd) {
     timeval limit{5, 0};
     setsockopt(fd, SOL_SOCKET, SO_RCVTIMEO, &limit, sizeof limit);
-    std::string request;
+    HttpRequestSeen seen;
+    std::string& request = seen.raw;
     char buffer[65536];
-    size_t wanted = std::string::npos;
+    size_t wanted = std::string::npos, headEnd = std::string::npos;
     while (wanted == std::string::npos || request.size() < wanted) {
         ssize_t n = recv(fd, buffer, sizeof buffer, 0);
         if (n <= 0) break;
         request.append(buffer, static_cast<size_t>(n));
-        size_t end = request.find("\r\n\r\n");
-        if (wanted == std::string::npos && end != std::string::npos) {
-            size_t at = request.find("Content-Length: ");
-            wanted = end + 4 + (at == std::string::npos ? 0 : std::stoul(request.substr(at + 16)));
+        if (wanted == std::string::npos &&
+            (headEnd = request.find("\r\n\r\n")) != std::string::npos) {
+            const std::string length = HeaderIn(request.substr(0, headEnd), "Content-Length");
+            wanted = headEnd + 4 + (length.empty() ? 0 : std::stoul(length));
         }
     }
+    size_t space = request.find(' ');
+    seen.method = request.substr(0, space);
+    if (space != std::string::npos) {
+        seen.target = request.substr(space + 1, request.find(' ', space + 1) - space - 1);
+    }
+    if (headEnd != std::string::npos) seen.body = request.substr(headEnd + 4);
     {
         std::lock_guard<std::mutex> lock(mutex_);
-        request_ = request;
+        requests_.push_back(seen);
     }
-    send(fd, response_.data(), response_.size(), MSG_NOSIGNAL);
+    const std::string response = handler_(seen);
+    send(fd, response.data(), response.size(), MSG_NOSIGNAL);
 }
 
 std::string HttpAnswer(const std::string& statusLine, const std::string& headers,
