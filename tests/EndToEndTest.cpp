@@ -18,7 +18,9 @@
 #include <string>
 #include <vector>
 
+#include "tests/support/AwsStandIns.h"
 #include "tests/support/S3rver.h"
+#include "tests/support/ScriptedHttpServer.h"
 #include "tests/support/TestSupport.h"
 
 namespace {
@@ -266,6 +268,76 @@ TEST(EndToEndTest, ToS3rverWithCredentialsFromACredentialProcess) {
     size_t objects = 0;
     for (size_t at = 0; (at = listing.output.find(".ts", at)) != std::string::npos; ++at) ++objects;
     EXPECT_EQ(objects, status.sequence.size()) << listing.output;
+}
+
+// An IAM user's long-term keys in a profile file and nothing else: the recorder has STS (the
+// stand-in, which checks that the keys signed the request) turn them into temporary ones, which
+// s3rver accepts.
+TEST(EndToEndTest, ToS3rverWithOnlyAStaticKeyProfile) {
+    using testsupport::S3rver;
+    S3rver server;
+    ASSERT_TRUE(server.Start(std::string(SFR_SOURCE_DIR) + "/scripts/s3rver.sh", BuildPath("node")))
+        << server.Error();
+    testsupport::ScriptedHttpServer sts([](const testsupport::HttpRequestSeen& request) {
+        if (testsupport::FormValue(request.body, "Action") != "GetSessionToken" ||
+            request.Header("Authorization").find("Credential=AKIALONGTERM/") == std::string::npos)
+            return testsupport::StsErrorAnswer("403 Forbidden", "AccessDenied", "wrong caller");
+        return testsupport::StsCredentialsAnswer(
+            "GetSessionToken", S3rver::kAccessKey, S3rver::kSecretKey, "session-token",
+            std::chrono::system_clock::now() + std::chrono::hours(12));
+    });
+    const std::string dir = Scratch("profile");
+    std::ofstream(dir + "/credentials") << "[recorder]\naws_access_key_id = AKIALONGTERM\n"
+                                           "aws_secret_access_key = long-term-secret\n";
+    auto r = RunProcess(
+        Words("env -u AWS_ACCESS_KEY_ID -u AWS_SECRET_ACCESS_KEY -u AWS_SESSION_TOKEN "
+              "AWS_PROFILE=recorder AWS_CONFIG_FILE=/dev/null AWS_EC2_METADATA_DISABLED=true") +
+            Args{"AWS_SHARED_CREDENTIALS_FILE=" + dir + "/credentials",
+                 "AWS_ENDPOINT_URL_STS=" + sts.Endpoint()} +
+            RecorderArgs(
+                ShortClip(), dir,
+                {"-readrate", "20", "-endpoint", server.Endpoint(), "-region", "us-east-1", "-sse",
+                 "AES256", "-storageclass", "STANDARD_IA", "-tagging", "site=north 1&cam=1"}),
+        120000);
+    const std::string log = ReadFile(dir + "/log.txt");
+    ASSERT_EQ(r.exitStatus, 0) << r.output << log;
+    EXPECT_NE(log.find("AWS credentials from shared config files via STS GetSessionToken"),
+              std::string::npos)
+        << log;
+    for (const char* secret : {"long-term-secret", S3rver::kSecretKey, "session-token"})
+        EXPECT_EQ(log.find(secret), std::string::npos) << secret;
+    Notified status = ReadStatus(dir + "/status.jsonl");
+    ASSERT_GE(status.sequence.size(), 2u) << log;
+
+    auto copy = RunProcess(
+        Words("env AWS_ACCESS_KEY_ID=AKIDTEST AWS_SECRET_ACCESS_KEY=secretTEST "
+              "AWS_DEFAULT_REGION=us-east-1 AWS_EC2_METADATA_DISABLED=true "
+              "AWS_CONFIG_FILE=/dev/null AWS_SHARED_CREDENTIALS_FILE=/dev/null /usr/bin/aws "
+              "--endpoint-url") +
+            Args{server.Endpoint(), "s3", "cp", "--recursive", "s3://rec/", dir + "/back"},
+        120000);
+    ASSERT_EQ(copy.exitStatus, 0) << copy.output;
+    size_t objects = 0;
+    std::string key;  // of one object
+    for (const auto& entry : fs::recursive_directory_iterator(dir + "/back")) {
+        if (entry.path().extension() != ".ts") continue;
+        ++objects;
+        key = fs::relative(entry.path(), dir + "/back").string();
+        auto decode =
+            RunProcess(Words("ffmpeg -v error -i") + Args{entry.path(), "-f", "null", "-"});
+        EXPECT_TRUE(decode.output.empty()) << entry.path() << ": " << decode.output;
+    }
+    EXPECT_EQ(objects, status.sequence.size());
+    // The upload options reached the store (s3rver keeps the storage class of the headers).
+    auto head = RunProcess(
+        Words("env AWS_ACCESS_KEY_ID=AKIDTEST AWS_SECRET_ACCESS_KEY=secretTEST "
+              "AWS_DEFAULT_REGION=us-east-1 AWS_EC2_METADATA_DISABLED=true "
+              "AWS_CONFIG_FILE=/dev/null AWS_SHARED_CREDENTIALS_FILE=/dev/null "
+              "/usr/bin/aws --endpoint-url") +
+            Args{server.Endpoint(), "s3api", "head-object", "--bucket", "rec", "--key", key},
+        120000);
+    EXPECT_NE(head.output.find("\"StorageClass\": \"STANDARD_IA\""), std::string::npos)
+        << head.output;
 }
 
 TEST(EndToEndTest, LiveUdpInputThatStopsAndStartsAgainIsRecordedAcrossTheGap) {

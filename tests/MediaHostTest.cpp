@@ -256,7 +256,10 @@ TEST(MediaHostTest, ReadRatePacesAFileDurationEndsItStopEndsItEarly) {
 TEST(MediaHostTest, CredentialsFromProcessEnvironmentOrNone) {
     const std::string clip = BFrameClip();
     ScopedEnv noKey("AWS_ACCESS_KEY_ID", nullptr), noSecret("AWS_SECRET_ACCESS_KEY", nullptr),
-        noToken("AWS_SESSION_TOKEN", nullptr);
+        noToken("AWS_SESSION_TOKEN", nullptr), noMetadata("AWS_EC2_METADATA_DISABLED", "true"),
+        noFiles("AWS_SHARED_CREDENTIALS_FILE", "/dev/null"),
+        noConfig("AWS_CONFIG_FILE", "/dev/null"),
+        noSts("AWS_ENDPOINT_URL_STS", "http://127.0.0.1:9");
     const auto common =
         Args(clip, "-readrate 0 -duration 0.2 -endpoint http://127.0.0.1:9 -region eu-west-3");
     {  // None at all: logged plainly, nothing delivered, not even on a token request.
@@ -293,7 +296,7 @@ TEST(MediaHostTest, CredentialsFromProcessEnvironmentOrNone) {
         EXPECT_EQ(CountContaining(capture, "s3cr3t"), 0u);
         unlink(counter.c_str());
     }
-    {  // A failing process falls back to the environment; static keys alone are not enough.
+    {  // Long-term keys that STS does not exchange pass on to the next source.
         ScopedEnv key("AWS_ACCESS_KEY_ID", "AKIDENV"), secret("AWS_SECRET_ACCESS_KEY", "envsecret");
         auto args = common;
         args.insert(args.end(),
@@ -302,7 +305,9 @@ TEST(MediaHostTest, CredentialsFromProcessEnvironmentOrNone) {
                                                        "\"SecretAccessKey\":\"b\"}'\n")});
         LogCapture capture;
         EXPECT_TRUE(HostRun(args).Run().properties.empty());
-        EXPECT_EQ(CountContaining(capture, "has no SessionToken", "AWS_SESSION_TOKEN not set"), 1u);
+        EXPECT_EQ(CountContaining(capture, "credential process: long-term keys not exchanged",
+                                  "environment: long-term keys not exchanged"),
+                  1u);
         ScopedEnv token("AWS_SESSION_TOKEN", "envtoken");
         auto props = HostRun(args).Run().properties;
         ASSERT_EQ(props.size(), 1u);

@@ -48,6 +48,15 @@ StoreCredentials Credentials(const std::string& secret = S3rver::kSecretKey) {
     return {S3rver::kAccessKey, secret, "tok-EN/with+chars==", "us-east-1", false};
 }
 
+// What the upload options make of -sse aws:kms -ssekmskeyid alias/rec -storageclass STANDARD_IA
+// -acl bucket-owner-full-control -tagging "site=north 1&cam=1".
+const std::vector<std::pair<std::string, std::string>> kUploadHeaders = {
+    {"x-amz-server-side-encryption", "aws:kms"},
+    {"x-amz-server-side-encryption-aws-kms-key-id", "alias/rec"},
+    {"x-amz-storage-class", "STANDARD_IA"},
+    {"x-amz-acl", "bucket-owner-full-control"},
+    {"x-amz-tagging", "site=north%201&cam=1"}};
+
 // Retries within a Put wait at most 1 ms here: these tests count attempts, not waits.
 S3StoreConfig Config(const std::string& endpoint) {
     S3StoreConfig config;
@@ -97,6 +106,15 @@ TEST_F(S3StoreTest, StoresObjectsByteIdenticalWithMetadata) {
     ObjectToStore second = Object("cam1/../x/./second.ts", body2);
     second.metadata["empty"] = "";  // signed and sent as an empty header
     ASSERT_EQ(store.Put(second, Credentials(), &info), Success);
+    // The upload options' headers are signed as sent (s3rver checks) and the storage class kept.
+    S3StoreConfig withOptions = Config(server_.Endpoint());
+    withOptions.objectHeaders = kUploadHeaders;
+    ASSERT_EQ(S3Store(withOptions).Put(Object("cam1/third.ts", body2), Credentials(), &info),
+              Success);
+    auto third =
+        Aws({"s3api", "head-object", "--bucket", S3rver::kBucket, "--key", "cam1/third.ts"});
+    EXPECT_NE(third.output.find("\"StorageClass\": \"STANDARD_IA\""), std::string::npos)
+        << third.output;
 
     const std::string copy = testsupport::BuildPath("s3store-copy-" + std::to_string(getpid()));
     auto cp = Aws({"s3", "cp", std::string("s3://") + S3rver::kBucket + "/" + key, copy});
@@ -155,7 +173,9 @@ TEST(S3StoreScriptedTest, RequestHeadersAndAnswers) {
     const std::string body = RandomBytes(70000, 4);
     const std::string md5Hex = digest::Hex(digest::Md5Of(body.data(), body.size()));
     Server ok(Server::Mode::kRespond, HttpAnswer("200 OK", "ETag: \"" + md5Hex + "\"\r\n"));
-    S3Store store(Config(ok.Endpoint()));
+    S3StoreConfig config = Config(ok.Endpoint());
+    config.objectHeaders = kUploadHeaders;
+    S3Store store(config);
     FileTransferInfo info;
     ASSERT_EQ(store.Put(Object("a b/../c/./d.ts", body), Credentials(), &info), Success);
     EXPECT_EQ(info.fileSize, body.size());
@@ -168,6 +188,15 @@ TEST(S3StoreScriptedTest, RequestHeadersAndAnswers) {
           std::string("content-type: video/mp2t\r\n"),
           std::string("x-amz-security-token: tok-EN/with+chars==\r\n"),
           std::string("x-amz-meta-streamingid: cam 1\r\n"),
+          std::string("x-amz-server-side-encryption: aws:kms\r\n"),
+          std::string("x-amz-server-side-encryption-aws-kms-key-id: alias/rec\r\n"),
+          std::string("x-amz-storage-class: STANDARD_IA\r\n"),
+          std::string("x-amz-acl: bucket-owner-full-control\r\n"),
+          std::string("x-amz-tagging: site=north%201&cam=1\r\n"),
+          std::string(";x-amz-acl;x-amz-content-sha256;x-amz-date;x-amz-meta-duration;"),
+          std::string("x-amz-security-token;x-amz-server-side-encryption;"
+                      "x-amz-server-side-encryption-aws-kms-key-id;x-amz-storage-class;"
+                      "x-amz-tagging,"),
           "Host: 127.0.0.1:" + std::to_string(ok.Port()) + "\r\n"}) {
         EXPECT_NE(head.find(header), std::string::npos) << header << head;
     }
@@ -176,10 +205,10 @@ TEST(S3StoreScriptedTest, RequestHeadersAndAnswers) {
 
     // A header value cannot smuggle in a header of its own.
     ObjectToStore sneaky = Object("s.ts", body);
-    sneaky.metadata["note"] = "x\r\nx-amz-acl: public-read";
+    sneaky.metadata["note"] = "x\r\nx-amz-grant-read: uri=everyone";
     ASSERT_EQ(store.Put(sneaky, Credentials(), &info), Success);
-    EXPECT_EQ(ok.Request().find("\r\nx-amz-acl"), std::string::npos);
-    EXPECT_NE(ok.Request().find("\r\nx-amz-meta-note: x__x-amz-acl: public-read\r\n"),
+    EXPECT_EQ(ok.Request().find("\r\nx-amz-grant-read"), std::string::npos);
+    EXPECT_NE(ok.Request().find("\r\nx-amz-meta-note: x__x-amz-grant-read: uri=everyone\r\n"),
               std::string::npos);
 
     const struct {
@@ -333,6 +362,7 @@ TEST(S3StoreConfigTest, AddressesObjectsAsAwsClientsDo) {
         const char* region;
         bool accelerate;
         const char* url;  // "" when the object cannot be addressed
+        S3Addressing addressing = S3Addressing::kAuto;
     } cases[] = {
         {"", "my-bucket", "cam 1/a+b.ts", "eu-west-1", false,
          "https://my-bucket.s3.eu-west-1.amazonaws.com/cam%201/a%2Bb.ts"},
@@ -352,12 +382,24 @@ TEST(S3StoreConfigTest, AddressesObjectsAsAwsClientsDo) {
         {"", "rec", "", "", false, ""},
         {"", "rec", "k", "eu-west-1.evil.example/", false, ""},
         {"http://127.0.0.1:9000", "rec", "k", "us-east-1\r\nx: y", false, ""},
+        // -addressing asks for one style.
+        {"", "my.bucket", "k.ts", "eu-west-1", false,
+         "https://my.bucket.s3.eu-west-1.amazonaws.com/k.ts", S3Addressing::kVirtual},
+        {"", "rec", "k.ts", "eu-west-1", true, "https://s3.eu-west-1.amazonaws.com/rec/k.ts",
+         S3Addressing::kPath},
+        {"https://minio.example:9000", "rec", "k.ts", "us-east-1", false,
+         "https://rec.minio.example:9000/k.ts", S3Addressing::kVirtual},
+        {"http://127.0.0.1:9000", "rec", "k.ts", "us-east-1", false, "", S3Addressing::kVirtual},
+        {"http://[::1]:9000", "rec", "k.ts", "us-east-1", false, "", S3Addressing::kVirtual},
+        {"https://minio.example", "Any_Name", "k", "us-east-1", false, "", S3Addressing::kVirtual},
     };
     for (const auto& c : cases) {
         S3Target t;
         std::string why;
         const StoreCredentials routing{"ak", "sk", "", c.region, c.accelerate};
-        EXPECT_EQ(S3TargetFor(c.endpoint, c.bucket, c.key, routing, t, why) ? t.url : "", c.url)
+        EXPECT_EQ(
+            S3TargetFor(c.endpoint, c.bucket, c.key, routing, t, why, c.addressing) ? t.url : "",
+            c.url)
             << c.bucket << " " << c.region << " " << why;
         if (!*c.url) continue;
         EXPECT_EQ(t.url.substr(t.url.find("://") + 3), t.host + t.canonicalUri);

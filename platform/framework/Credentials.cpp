@@ -7,61 +7,16 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <cctype>
 #include <chrono>
-#include <cstdlib>
-#include <nlohmann/json.hpp>
 
 extern char** environ;
 
 namespace credentials {
 
-namespace {
-
-std::string envValue(const char* name) {
-    const char* v = std::getenv(name);
-    return v ? std::string(v) : std::string();
-}
-
-bool isFileEndpoint(const std::string& endpoint) {
-    if (endpoint.size() < 5) return false;
-    std::string scheme = endpoint.substr(0, 5);
-    for (char& c : scheme) c = static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
-    return scheme == "file:";
-}
-
-std::map<std::string, std::string> properties(const std::string& accessKey,
-                                              const std::string& secretKey,
-                                              const std::string& sessionToken,
-                                              const std::string& region) {
-    return {{"awsAccessKey", accessKey},
-            {"awsSecretKey", secretKey},
-            {"sessionToken", sessionToken},
-            {"region", region}};
-}
-
-}  // namespace
-
-bool ParseProcessOutput(const std::string& json, std::string* accessKey, std::string* secretKey,
-                        std::string* sessionToken, std::string* why) {
-    nlohmann::json document = nlohmann::json::parse(json, nullptr, false);
-    if (document.is_discarded() || !document.is_object()) {
-        *why = "its output is not a JSON object";
-        return false;
-    }
-    const std::pair<const char*, std::string*> fields[] = {
-        {"AccessKeyId", accessKey}, {"SecretAccessKey", secretKey}, {"SessionToken", sessionToken}};
-    for (const auto& [name, target] : fields) {
-        auto it = document.find(name);
-        if (it == document.end() || !it->is_string() || it->get<std::string>().empty()) {
-            *why = std::string("its output has no ") + name;
-            if (std::string(name) == "SessionToken")
-                *why += " (the recorder takes temporary credentials only)";
-            return false;
-        }
-        *target = it->get<std::string>();
-    }
-    return true;
+awsauth::Lookup ParseProcessOutput(const std::string& json) {
+    awsauth::Lookup lookup = awsauth::CredentialsFromJson(json, "SessionToken");
+    if (!lookup.Ok()) lookup.why = "its output: " + lookup.why;
+    return lookup;
 }
 
 bool RunCommand(const std::string& command, int timeoutMs, std::string* output, std::string* why) {
@@ -139,48 +94,31 @@ bool RunCommand(const std::string& command, int timeoutMs, std::string* output, 
     return true;
 }
 
-Result Fetch(const FrameworkOptions& options) {
-    Result result;
-    if (isFileEndpoint(options.endpoint)) {
-        result.ok = true;
-        result.source = "local store";
-        result.properties = properties("local", "local", "local", options.region);
-        return result;
+awsauth::Lookup FromCredentialProcess(const std::string& command) {
+    std::string output, why;
+    if (!RunCommand(command, kProcessTimeoutMs, &output, &why)) {
+        return awsauth::Lookup::Failed("the credential process failed: " + why);
     }
-    std::string reasons;
-    if (!options.credentialProcess.empty()) {
-        std::string output, why, accessKey, secretKey, token;
-        if (RunCommand(options.credentialProcess, kProcessTimeoutMs, &output, &why) &&
-            ParseProcessOutput(output, &accessKey, &secretKey, &token, &why)) {
-            result.ok = true;
-            result.source = "credential process";
-            result.properties = properties(accessKey, secretKey, token, options.region);
-            return result;
-        }
-        reasons = "the credential process failed: " + why + "; ";
+    awsauth::Lookup lookup = ParseProcessOutput(output);
+    if (!lookup.Ok()) lookup.why = "the credential process failed: " + lookup.why;
+    return lookup;
+}
+
+awsauth::Lookup FromEnvironment(const awsauth::Environment& environment) {
+    awsauth::AwsCredentials found;
+    found.accessKey = environment("AWS_ACCESS_KEY_ID");
+    found.secretKey = environment("AWS_SECRET_ACCESS_KEY");
+    found.sessionToken = environment("AWS_SESSION_TOKEN");
+    if (!found.accessKey.empty() && !found.secretKey.empty()) {
+        return awsauth::Lookup::Found(found);
     }
-    const std::string accessKey = envValue("AWS_ACCESS_KEY_ID");
-    const std::string secretKey = envValue("AWS_SECRET_ACCESS_KEY");
-    const std::string token = envValue("AWS_SESSION_TOKEN");
-    if (!accessKey.empty() && !secretKey.empty() && !token.empty()) {
-        result.ok = true;
-        result.source = "environment";
-        result.properties = properties(accessKey, secretKey, token, options.region);
-        return result;
+    if (found.accessKey.empty() && found.secretKey.empty() && found.sessionToken.empty()) {
+        return awsauth::Lookup::Absent(
+            "no AWS_ACCESS_KEY_ID, AWS_SECRET_ACCESS_KEY, AWS_SESSION_TOKEN");
     }
-    if (accessKey.empty() && secretKey.empty() && token.empty()) {
-        reasons +=
-            "no AWS_ACCESS_KEY_ID, AWS_SECRET_ACCESS_KEY, AWS_SESSION_TOKEN in the "
-            "environment";
-    } else {
-        std::string missing;
-        for (const char* name : {"AWS_ACCESS_KEY_ID", "AWS_SECRET_ACCESS_KEY", "AWS_SESSION_TOKEN"})
-            if (envValue(name).empty()) missing += std::string(missing.empty() ? "" : ", ") + name;
-        reasons += missing + " not set (the recorder takes temporary credentials only)";
-    }
-    if (options.credentialProcess.empty()) reasons += "; no -credentialprocess given";
-    result.why = reasons;
-    return result;
+    return awsauth::Lookup::Failed(
+        std::string(found.accessKey.empty() ? "AWS_ACCESS_KEY_ID" : "AWS_SECRET_ACCESS_KEY") +
+        " not set");
 }
 
 }  // namespace credentials

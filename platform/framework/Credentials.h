@@ -1,45 +1,45 @@
-// Credentials: where the standalone host finds the AWS credentials it hands to the module.
-//
-// In order, the first that gives a complete set:
-//   - a `file://` endpoint: fixed local credentials (the local directory store checks none);
+// Credentials: the two credential sources that read this host's own settings, the first two
+// links of the chain that HostCredentials builds:
 //   - `-credentialprocess CMD`: CMD run through /bin/sh, its standard output read as AWS
-//     `credential_process` JSON (AccessKeyId, SecretAccessKey, SessionToken; Expiration is
-//     not needed because the host asks again on every token request);
+//     `credential_process` JSON (AccessKeyId, SecretAccessKey, SessionToken, Expiration);
 //   - the environment: AWS_ACCESS_KEY_ID, AWS_SECRET_ACCESS_KEY, AWS_SESSION_TOKEN.
-// The region comes from the options (-region, AWS_REGION, AWS_DEFAULT_REGION, us-east-1).
-// The module accepts only temporary credentials (all four values present), so a set without a
-// session token is incomplete.
+// Either may give long-term keys (no session token); the chain exchanges those for temporary
+// ones, because the module accepts only temporary credentials (all four values present).
 //
 // Secrets never reach a log line or an error text: texts name the source and the missing
 // field only.
 //
-// Threads: Fetch keeps no state; it may run on several threads at once (the message thread
-// after the connection reply, the upload thread on a token request).
+// Threads: nothing here keeps state; any function may run on several threads at once.
 #pragma once
 
 #include <map>
 #include <string>
 
-#include "platform/framework/FrameworkOptions.h"
+#include "platform/awsauth/AwsCredentials.h"
 
 namespace credentials {
 
 // How long a credential process may take before it is killed.
 constexpr int kProcessTimeoutMs = 10000;
 
+// What the host hands to the module, or why it has nothing.
 struct Result {
     bool ok = false;
-    std::string source;  // "local store", "credential process", "environment"
+    std::string source;  // "local store", "credential process", "environment", ...
     std::map<std::string, std::string> properties;  // the four keys of setProperties
     std::string why;  // when !ok: why there are none, for the log (no secrets)
 };
 
-Result Fetch(const FrameworkOptions& options);
+// Reads `credential_process` output. Failed with a reason (no secrets) when it is not JSON,
+// not an object, or lacks the key id or the secret.
+awsauth::Lookup ParseProcessOutput(const std::string& json);
 
-// Parses `credential_process` output. False with a reason (no secrets) when it is not JSON,
-// not an object, or lacks one of the three strings.
-bool ParseProcessOutput(const std::string& json, std::string* accessKey, std::string* secretKey,
-                        std::string* sessionToken, std::string* why);
+// The -credentialprocess link (also runs a profile's credential_process): RunCommand with
+// kProcessTimeoutMs, then ParseProcessOutput.
+awsauth::Lookup FromCredentialProcess(const std::string& command);
+
+// The environment link: absent when none of the three variables is set.
+awsauth::Lookup FromEnvironment(const awsauth::Environment& environment);
 
 // Runs `command` through /bin/sh, collects its standard output (its standard error goes to
 // ours); false with a reason when it cannot start, exits non-zero, is killed or takes longer

@@ -114,6 +114,7 @@ FrameworkOptions FrameworkOptions::Read(const CommandLine& cl, std::vector<std::
     }
     cl.Find("logfile", o.logFile);
     cl.Find("status", o.statusPath);
+    o.upload = UploadOptions::Read(cl, errors);
     return o;
 }
 

@@ -7,6 +7,8 @@
 #include <string>
 #include <vector>
 
+#include "platform/framework/UploadOptions.h"
+
 // Reads `-name value` pairs out of argv. Thread-safe after construction (read-only).
 class CommandLine {
   public:
@@ -36,6 +38,7 @@ struct FrameworkOptions {
     int logLevel = 11;                 // -loglevel
     std::string logFile;               // -logfile, empty: stderr
     std::string statusPath = "-";      // -status, "-": stdout
+    UploadOptions upload;              // -sse, -storageclass, -acl, -tagging, -addressing, ...
 
     // Reads every option; problems (unreadable numbers) are appended to `errors`, and the
     // option keeps its default.

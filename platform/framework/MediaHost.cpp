@@ -10,7 +10,7 @@ extern "C" {
 #include <utility>
 #include <vector>
 
-#include "platform/framework/Credentials.h"
+#include "platform/framework/HostCredentials.h"
 #include "platform/framework/Pacer.h"
 #include "platform/framework/SignalHandling.h"
 #include "platform/logger/Logger.h"
@@ -31,7 +31,8 @@ MediaHost::MediaHost(FrameworkOptions options, bool handleSignals)
     : options_(std::move(options)),
       live_(MediaInput::IsLive(options_.input)),
       handleSignals_(handleSignals),
-      shownInput_(MediaInput::Redacted(options_.input)) {}
+      shownInput_(MediaInput::Redacted(options_.input)),
+      credentials_(std::make_unique<HostCredentials>(options_)) {}
 
 MediaHost::~MediaHost() {
     Stop();
@@ -72,7 +73,10 @@ void MediaHost::Run(BaseProcess& process) {
 
     ConnectResponse reply;
     process.notifyModuleConnectionRequestReply(reply);
-    deliverCredentials(process, "after the connection reply");
+    deliverCredentials(process, "after the connection reply", false);
+    credentials_->StartRenewing([&process](const credentials::Result& renewed) {
+        handOver(process, renewed, "before the credentials expire");
+    });
 
     if (input_) {
         receiver_ = std::thread([this, &process] { receive(process); });
@@ -96,18 +100,25 @@ void MediaHost::Run(BaseProcess& process) {
                     "end of stream: not everything held was stored within %lld ms",
                     static_cast<long long>(timeoutMs));
     }
+    credentials_->Stop();  // nothing is handed over once Run has returned
     input_.reset();
     // `signals` ends here: from now on a signal takes its previous action again, except that
     // one that arrives while the handlers are still installed counts as the second.
 }
 
 void MediaHost::OnTokenRequest(const GetAWSSecureTokenRequest&) {
-    if (process_) deliverCredentials(*process_, "on a token request");
+    // The module asks after its credentials were refused (or before it has any): ask the
+    // sources again rather than hand over the same ones.
+    if (process_) deliverCredentials(*process_, "on a token request", true);
 }
 
-void MediaHost::deliverCredentials(BaseProcess& process, const char* occasion) {
-    constexpr const char* fn = "MediaHost::deliverCredentials";
-    credentials::Result credentials = credentials::Fetch(options_);
+void MediaHost::deliverCredentials(BaseProcess& process, const char* occasion, bool refresh) {
+    handOver(process, credentials_->Fetch(refresh), occasion);
+}
+
+void MediaHost::handOver(BaseProcess& process, const credentials::Result& credentials,
+                         const char* occasion) {
+    constexpr const char* fn = "MediaHost::handOver";
     if (!credentials.ok) {
         Logger::Put(5, kFile, fn, __LINE__, "no credentials to hand over %s: %s", occasion,
                     credentials.why.c_str());
@@ -115,7 +126,8 @@ void MediaHost::deliverCredentials(BaseProcess& process, const char* occasion) {
     }
     Logger::Put(12, kFile, fn, __LINE__, "credentials from the %s handed over %s",
                 credentials.source.c_str(), occasion);
-    process.setProperties(credentials.properties);
+    std::map<std::string, std::string> properties = credentials.properties;  // the hook may edit
+    process.setProperties(properties);
 }
 
 bool MediaHost::reopen(std::string why) {

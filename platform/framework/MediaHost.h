@@ -16,7 +16,9 @@
 //      returns; Execute then delivers the disconnection request. A second SIGINT/SIGTERM ends the
 //      process at once (SignalHandling).
 // OnTokenRequest (upload thread) answers every token request with setProperties, holding no
-// lock of its own while it calls into the module.
+// lock of its own while it calls into the module. Credentials come from HostCredentials, which
+// also hands over renewed ones before the current ones expire, on its own thread, until Run
+// returns.
 //
 // The attribute block of each sample: rtpTime / attribute2 the presentation / decode time in
 // the track's media clock (90 kHz for video and meta, the sample rate for audio), timestamp the
@@ -31,6 +33,7 @@
 #include <thread>
 
 #include "platform/framework/BaseProcess.h"
+#include "platform/framework/HostCredentials.h"
 #include "platform/framework/MediaInput.h"
 #include "platform/framework/SampleClock.h"
 #include "platform/framework/StopSignal.h"
@@ -57,8 +60,11 @@ class MediaHost : public IModuleHost {
 
   private:
     void receive(BaseProcess& process);
-    // Fetches the credentials and hands them to the module; logs why when there are none.
-    void deliverCredentials(BaseProcess& process, const char* occasion);
+    // Fetches the credentials (asking the sources again when `refresh`) and hands them over.
+    void deliverCredentials(BaseProcess& process, const char* occasion, bool refresh);
+    // Hands credentials to the module; logs why when there are none.
+    static void handOver(BaseProcess& process, const credentials::Result& credentials,
+                         const char* occasion);
     void deliver(BaseProcess& process, const MediaInput::Packet& packet,
                  const SampleClock::Times& times);
     // Reopens the live input after `why`; false when stopped meanwhile.
@@ -78,4 +84,7 @@ class MediaHost : public IModuleHost {
     std::chrono::seconds reopenPause_ = kFirstReopenPause;
     std::string endReason_;  // why reading ended; written by the receive thread before it ends
     std::thread receiver_;
+    // Renews credentials before they expire on a thread of its own, from the connection reply
+    // until Run ends.
+    std::unique_ptr<HostCredentials> credentials_;
 };

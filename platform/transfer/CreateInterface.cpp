@@ -96,6 +96,12 @@ std::shared_ptr<IObjectStore> createS3Store(const FrameworkOptions& options) {
                     withoutUserInfo(options.endpoint).c_str(), why.c_str());
         return nullptr;
     }
+    const UploadOptions& upload = options.upload;
+    config.objectHeaders = upload.Headers();
+    config.caBundle = upload.caBundle;
+    config.addressing = upload.addressing == "path"      ? S3Addressing::kPath
+                        : upload.addressing == "virtual" ? S3Addressing::kVirtual
+                                                         : S3Addressing::kAuto;
     return std::make_shared<S3Store>(config);
 }
 

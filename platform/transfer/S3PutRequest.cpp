@@ -45,7 +45,8 @@ S3Payload DigestS3Payload(const ObjectToStore& object) {
 
 S3PutRequest SignS3Put(const S3Target& target, const ObjectToStore& object,
                        const StoreCredentials& credentials, const S3Payload& payload,
-                       const std::string& amzDate) {
+                       const std::string& amzDate,
+                       const std::vector<std::pair<std::string, std::string>>& objectHeaders) {
     SigV4Request request;
     request.method = "PUT";
     request.canonicalUri = target.canonicalUri;
@@ -58,6 +59,8 @@ S3PutRequest SignS3Put(const S3Target& target, const ObjectToStore& object,
     if (!credentials.sessionToken.empty())
         request.headers.emplace_back("x-amz-security-token", HeaderValue(credentials.sessionToken));
     AddMetadata(object, request);
+    for (const auto& [name, value] : objectHeaders)
+        request.headers.emplace_back(httptext::Lower(name), HeaderValue(value));
 
     const SigV4Key key{credentials.accessKey, credentials.secretKey, target.signingRegion, "s3"};
     const SigV4Signature signature = SigV4Signer::Sign(request, key, amzDate);

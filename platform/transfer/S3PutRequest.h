@@ -7,8 +7,9 @@
 // own), so any server signs exactly what it received.
 //
 // Headers: host, Content-MD5, Content-Type, x-amz-content-sha256 (the body's SHA-256),
-// x-amz-date, x-amz-security-token when there is a session token, and the object's metadata as
-// x-amz-meta-* (names folded to HTTP tokens; of two names that fold into one, the first wins).
+// x-amz-date, x-amz-security-token when there is a session token, the object's metadata as
+// x-amz-meta-* (names folded to HTTP tokens; of two names that fold into one, the first wins),
+// and the store's headers of every object (encryption, storage class, ACL, tags).
 #pragma once
 
 #include <string>
@@ -35,7 +36,8 @@ struct S3PutRequest {
 };
 
 // Signs the PUT of `object`, whose digests are `payload`, to `target` at `amzDate`
-// ("YYYYMMDDTHHMMSSZ").
+// ("YYYYMMDDTHHMMSSZ"), with `objectHeaders` (x-amz-* names) besides the object's own.
 S3PutRequest SignS3Put(const S3Target& target, const ObjectToStore& object,
                        const StoreCredentials& credentials, const S3Payload& payload,
-                       const std::string& amzDate);
+                       const std::string& amzDate,
+                       const std::vector<std::pair<std::string, std::string>>& objectHeaders = {});

@@ -242,6 +242,7 @@ void SetUpEasy(CURL* easy, const std::string& url, const S3StoreConfig& config, 
     curl_easy_setopt(easy, CURLOPT_CONNECTTIMEOUT_MS, config.connectTimeoutMs);
     curl_easy_setopt(easy, CURLOPT_LOW_SPEED_LIMIT, config.lowSpeedLimit);
     curl_easy_setopt(easy, CURLOPT_LOW_SPEED_TIME, config.lowSpeedTimeS);
+    if (!config.caBundle.empty()) curl_easy_setopt(easy, CURLOPT_CAINFO, config.caBundle.c_str());
     curl_easy_setopt(easy, CURLOPT_TCP_KEEPALIVE, 1L);
     // The key goes as signed: "." and ".." parts are part of the key, not steps in a path.
     curl_easy_setopt(easy, CURLOPT_PATH_AS_IS, 1L);
@@ -355,7 +356,8 @@ AttemptOutcome S3Store::attempt(const S3Target& target, const ObjectToStore& obj
                                 const StoreCredentials& credentials, const S3Payload& payload) {
     // Signed anew: the signature covers the time of sending.
     const S3PutRequest request =
-        SignS3Put(target, object, credentials, payload, SigV4Signer::AmzDate(signer_.Now()));
+        SignS3Put(target, object, credentials, payload, SigV4Signer::AmzDate(signer_.Now()),
+                  config_.objectHeaders);
     S3Exchange exchange;
     if (!perform(target.url, request, object, exchange)) {
         Logger::Put(4, kFile, kPut, __LINE__, "PUT %s/%s not sent: out of memory",
@@ -389,7 +391,8 @@ FileTransferResult S3Store::checkSendable(const ObjectToStore& object,
                     object.key.c_str(), why.c_str());
         return AuthenticationError;
     }
-    if (!S3TargetFor(endpoint_, object.bucket, object.key, credentials, target, why)) {
+    if (!S3TargetFor(endpoint_, object.bucket, object.key, credentials, target, why,
+                     config_.addressing)) {
         Logger::Put(5, kFile, kPut, __LINE__, "PUT \"%s/%s\" not sent: %s", object.bucket.c_str(),
                     object.key.c_str(), why.c_str());
         return FilePathError;

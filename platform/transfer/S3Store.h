@@ -37,7 +37,7 @@ struct S3Exchange;  // what one HTTP exchange gave (curl's codes, the answer); s
 
 struct S3StoreConfig {
     // "" for AWS (addressed as S3Target says), or "http[s]://host[:port]" for another S3
-    // server: path-style ENDPOINT/BUCKET/KEY.
+    // server: path-style ENDPOINT/BUCKET/KEY unless `addressing` says virtual.
     // Parse checks and normalises it; the store uses only what Parse accepts.
     std::string endpoint;
     long connectTimeoutMs = 10000;  // connection set-up (TCP and TLS)
@@ -47,6 +47,11 @@ struct S3StoreConfig {
     // Initial offset of the signing clock against the system clock (tests use it to sign with
     // a wrong clock); corrected after RequestTimeTooSkewed.
     std::chrono::seconds clockOffset{0};
+    S3Addressing addressing = S3Addressing::kAuto;
+    // Sent and signed with every object: x-amz-server-side-encryption, x-amz-storage-class,
+    // x-amz-acl, x-amz-tagging and the like (names in lower case).
+    std::vector<std::pair<std::string, std::string>> objectHeaders;
+    std::string caBundle;  // PEM file of the CAs that TLS servers are checked with; "" system's
 
     // Checks `endpointUrl` ("" or "http[s]://host[:port][/]", without user, path or query) and
     // sets out.endpoint to its normal form; the other fields of `out` are left as they are.

@@ -57,12 +57,13 @@ bool ControlCharacter(unsigned char c) {
 }
 
 // The AWS host that serves `bucket` in `region`, and whether the bucket goes into the path.
-void AwsHost(const std::string& bucket, const StoreCredentials& credentials, std::string& host,
-             bool& pathStyle) {
+void AwsHost(const std::string& bucket, const StoreCredentials& credentials,
+             S3Addressing addressing, std::string& host, bool& pathStyle) {
     const std::string& region = credentials.region;
     const bool china = StartsWith(region, "cn-");
     const std::string domain = china ? "amazonaws.com.cn" : "amazonaws.com";
-    pathStyle = bucket.find('.') != std::string::npos;
+    pathStyle = addressing == S3Addressing::kPath ||
+                (addressing == S3Addressing::kAuto && bucket.find('.') != std::string::npos);
     const std::string regional = region.empty() ? "s3." + domain : "s3." + region + "." + domain;
     if (pathStyle) {
         host = regional;
@@ -103,7 +104,8 @@ bool ValidateCredentialText(const StoreCredentials& credentials, std::string& wh
 }
 
 bool S3TargetFor(const std::string& endpoint, const std::string& bucket, const std::string& key,
-                 const StoreCredentials& credentials, S3Target& out, std::string& why) {
+                 const StoreCredentials& credentials, S3Target& out, std::string& why,
+                 S3Addressing addressing) {
     if (bucket.empty() || key.empty()) return Fail(why, "empty bucket or key");
     const bool aws = endpoint.empty();
     if (!credentials.region.empty() && !ValidateRegion(credentials.region, aws, why)) return false;
@@ -114,12 +116,23 @@ bool S3TargetFor(const std::string& endpoint, const std::string& bucket, const s
         size_t schemeEnd = endpoint.find("://");
         if (schemeEnd == std::string::npos) return Fail(why, "endpoint without scheme");
         out.host = endpoint.substr(schemeEnd + 3);
-        out.canonicalUri = "/" + SigV4Signer::EncodeComponent(bucket) + "/" + encodedKey;
-        out.url = endpoint + out.canonicalUri;
+        if (addressing != S3Addressing::kVirtual) {
+            out.canonicalUri = "/" + SigV4Signer::EncodeComponent(bucket) + "/" + encodedKey;
+            out.url = endpoint + out.canonicalUri;
+            return true;
+        }
+        const std::string name = out.host.substr(0, out.host.rfind(':'));
+        in_addr address{};
+        if (out.host[0] == '[' || inet_pton(AF_INET, name.c_str(), &address) == 1)
+            return Fail(why, "virtual-hosted addressing needs an endpoint with a host name");
+        if (!ValidateBucketName(bucket, why)) return false;
+        out.host = bucket + "." + out.host;
+        out.canonicalUri = "/" + encodedKey;
+        out.url = endpoint.substr(0, schemeEnd + 3) + out.host + out.canonicalUri;
         return true;
     }
     bool pathStyle = false;
-    AwsHost(bucket, credentials, out.host, pathStyle);
+    AwsHost(bucket, credentials, addressing, out.host, pathStyle);
     out.canonicalUri = pathStyle ? "/" + bucket + "/" + encodedKey : "/" + encodedKey;
     out.url = "https://" + out.host + out.canonicalUri;
     return true;

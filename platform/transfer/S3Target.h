@@ -12,12 +12,23 @@
 //                   acceleration cannot serve such a bucket, so it goes to its region)
 //   China           regions cn-* are served under amazonaws.com.cn (no acceleration there).
 // Any other endpoint ("http[s]://host[:port]") is addressed path-style: ENDPOINT/BUCKET/KEY.
+// S3Addressing may ask for one style everywhere instead (-addressing path|virtual).
 // The key is sent exactly as it is, "." and ".." parts included (the URL is not normalised).
 #pragma once
 
 #include <string>
 
 #include "platform/transfer/ObjectStore.h"
+
+// How the bucket is named in a request.
+enum class S3Addressing {
+    kAuto,     // as above
+    kPath,     // path-style everywhere; on AWS never accelerated (acceleration has
+               // virtual-hosted names only)
+    kVirtual,  // virtual-hosted everywhere, also for dotted bucket names on AWS (a private CA or
+               // an endpoint over http may make that work); on another endpoint
+               // http[s]://BUCKET.HOST[:PORT]/KEY, which needs a host name, not an IP address
+};
 
 struct S3Target {
     std::string url;            // the whole request URL, key percent-encoded
@@ -31,7 +42,8 @@ struct S3Target {
 // ValidateBucketName; on other endpoints only an empty one), or a region ValidateRegion refuses
 // (the reason then names the region).
 bool S3TargetFor(const std::string& endpoint, const std::string& bucket, const std::string& key,
-                 const StoreCredentials& credentials, S3Target& out, std::string& why);
+                 const StoreCredentials& credentials, S3Target& out, std::string& why,
+                 S3Addressing addressing = S3Addressing::kAuto);
 
 // Whether S3 can address a bucket of this name: 3 to 63 characters of lower-case letters,
 // digits, '.' and '-', beginning and ending with a letter or digit, no ".." and no ".-"/"-.",
