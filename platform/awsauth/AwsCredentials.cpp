@@ -81,15 +81,4 @@ Lookup CredentialsFromJson(const std::string& json, const std::string& tokenFiel
     return Lookup::Found(std::move(credentials));
 }
 
-std::string Redact(std::string text, std::initializer_list<std::string> secrets) {
-    for (const auto& secret : secrets) {
-        if (secret.size() < 4) continue;
-        for (size_t at = text.find(secret); at != std::string::npos;
-             at = text.find(secret, at + 3)) {
-            text.replace(at, secret.size(), "***");
-        }
-    }
-    return text;
-}
-
 }  // namespace awsauth

@@ -58,7 +58,4 @@ bool ParseIsoTime(const std::string& text, Clock::time_point& out);
 // Expiration. Failed with a reason (no secrets) when it is not such a document.
 Lookup CredentialsFromJson(const std::string& json, const std::string& tokenField);
 
-// Replaces every occurrence of the secrets (those of 4 characters and more) with "***".
-std::string Redact(std::string text, std::initializer_list<std::string> secrets);
-
 }  // namespace awsauth

@@ -5,6 +5,7 @@
 #include <set>
 
 #include "platform/transfer/Digest.h"
+#include "platform/transfer/HttpText.h"
 #include "platform/transfer/SigV4Signer.h"
 
 namespace awsauth {
@@ -190,11 +191,11 @@ Lookup StsClient::call(const char* action, const std::string& form,
     HttpResponse response;
     std::string why;
     if (!Send(request, response, why)) return Lookup::Failed(what + " at " + url_ + ": " + why);
-    const std::initializer_list<std::string> secrets = {signWith ? signWith->secretKey : "",
-                                                        signWith ? signWith->sessionToken : ""};
+    const std::vector<std::string> secrets = {signWith ? signWith->secretKey : "",
+                                              signWith ? signWith->sessionToken : ""};
     if (response.status != 200) {
         std::string code = XmlText(response.body, "Code");
-        std::string message = Redact(XmlText(response.body, "Message"), secrets);
+        std::string message = httptext::Redact(XmlText(response.body, "Message"), secrets);
         return Lookup::Failed(what + ": HTTP " + std::to_string(response.status) +
                               (code.empty() ? "" : " " + code) +
                               (message.empty() ? "" : " \"" + message + "\""));

@@ -40,4 +40,15 @@ std::string PercentEncode(const std::string& text, bool (*keep)(unsigned char)) 
     return out;
 }
 
+std::string Redact(std::string text, const std::vector<std::string>& secrets) {
+    for (const auto& secret : secrets) {
+        if (secret.size() < 4) continue;
+        for (size_t at = text.find(secret); at != std::string::npos;
+             at = text.find(secret, at + 3)) {
+            text.replace(at, secret.size(), "***");
+        }
+    }
+    return text;
+}
+
 }  // namespace httptext

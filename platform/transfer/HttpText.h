@@ -3,6 +3,7 @@
 #pragma once
 
 #include <string>
+#include <vector>
 
 namespace httptext {
 
@@ -15,5 +16,9 @@ std::string FoldSpaces(const std::string& value, bool printableOnly);
 
 // Percent-encodes (upper-case hex) every byte for which `keep` is false.
 std::string PercentEncode(const std::string& text, bool (*keep)(unsigned char));
+
+// Replaces every occurrence of each secret of 4 characters or more with "***": for texts from
+// a server or a library that are about to be logged.
+std::string Redact(std::string text, const std::vector<std::string>& secrets);
 
 }  // namespace httptext

@@ -37,18 +37,6 @@ std::string Printable(const std::string& value) {
     return httptext::FoldSpaces(value, true);
 }
 
-// Replaces every occurrence of the secrets in a text that is about to be logged.
-std::string Redact(std::string text, const std::vector<std::string>& secrets) {
-    for (const auto& secret : secrets) {
-        if (secret.size() < 4) continue;
-        for (size_t at = text.find(secret); at != std::string::npos;
-             at = text.find(secret, at + 3)) {
-            text.replace(at, secret.size(), "***");
-        }
-    }
-    return text;
-}
-
 struct Body {
     const uint8_t* data = nullptr;
     size_t size = 0;
@@ -455,7 +443,7 @@ AttemptOutcome S3Store::interpret(const S3Exchange& exchange, const ObjectToStor
         FileTransferResult result = ClassifyCurlError(exchange.transferCode);
         Logger::Put(5, kFile, kPut, __LINE__, "PUT %s failed after %u ms: %s (curl %d) -> %x",
                     where.c_str(), exchange.responseTimeMs,
-                    Redact(exchange.curlError, secrets).c_str(),
+                    httptext::Redact(exchange.curlError, secrets).c_str(),
                     static_cast<int>(exchange.transferCode), static_cast<unsigned>(result));
         return {result, RetryableCurlError(exchange.transferCode)};
     }
@@ -464,7 +452,7 @@ AttemptOutcome S3Store::interpret(const S3Exchange& exchange, const ObjectToStor
     FileTransferResult result = ClassifyS3Answer(response.status, code);
     if (result == Success) return {checkStored(exchange, where, object.size, md5Hex), false};
 
-    std::string message = Redact(Printable(response.XmlElement("Message")), secrets);
+    std::string message = httptext::Redact(Printable(response.XmlElement("Message")), secrets);
     std::string requestId = Printable(response.requestId);
     if (!requestId.empty()) requestId = " request id " + requestId;
     Logger::Put(5, kFile, kPut, __LINE__, "PUT %s: HTTP %ld %s \"%s\"%s -> %x", where.c_str(),
