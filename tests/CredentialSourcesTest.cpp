@@ -1,6 +1,7 @@
 // The credential sources of the chain, each against a stand-in on 127.0.0.1 that answers as
 // the real service does: the container endpoint, the instance metadata service (IMDSv2), the
-// shared config files' profiles (STS AssumeRole and friends) and web identity.
+// shared config files' profiles (STS AssumeRole and friends) and web identity; and the private
+// CA bundle that their client and the S3 store trust.
 #include <gtest/gtest.h>
 #include <unistd.h>
 
@@ -9,9 +10,12 @@
 #include <map>
 
 #include "platform/awsauth/ContainerCredentials.h"
+#include "platform/awsauth/HttpClient.h"
 #include "platform/awsauth/InstanceMetadata.h"
 #include "platform/awsauth/ProfileCredentials.h"
 #include "platform/awsauth/WebIdentityCredentials.h"
+#include "platform/logger/LogCapture.h"
+#include "platform/transfer/S3Store.h"
 #include "tests/support/AwsStandIns.h"
 #include "tests/support/ScriptedHttpServer.h"
 #include "tests/support/TestSupport.h"
@@ -304,4 +308,59 @@ TEST(WebIdentityCredentialsTest, ReadsTheTokenFileOnEveryFetch) {
     variables.erase("AWS_ROLE_ARN");
     EXPECT_EQ(WebIdentityCredentials(Env(variables), client).Fetch().outcome,
               Lookup::Outcome::kFailed);
+}
+
+// AWS_CA_BUNDLE: a server whose certificate only the bundle vouches for is trusted with the
+// bundle and refused without it, by the credential sources' client and by the S3 store.
+TEST(CaBundleTest, TrustsTheServersTheBundleVouchesFor) {
+    const std::string dir = Scratch("ca");
+    ASSERT_EQ(testsupport::RunProcess({"openssl", "req", "-x509", "-newkey", "rsa:2048", "-nodes",
+                                       "-keyout", dir + "/key.pem", "-out", dir + "/cert.pem",
+                                       "-days", "1", "-subj", "/CN=127.0.0.1", "-addext",
+                                       "subjectAltName=IP:127.0.0.1"})
+                  .exitStatus,
+              0);
+    testsupport::ChildProcess server({"openssl", "s_server", "-accept", "127.0.0.1:0", "-cert",
+                                      dir + "/cert.pem", "-key", dir + "/key.pem", "-www"},
+                                     dir + "/server.txt");
+    std::string port;
+    ASSERT_TRUE(testsupport::WaitUntil([&] {
+        const std::string text = testsupport::ReadFile(dir + "/server.txt");
+        const size_t at = text.find("ACCEPT 127.0.0.1:");
+        if (at == std::string::npos || text.find('\n', at) == std::string::npos) return false;
+        port = text.substr(at + 17, text.find('\n', at) - at - 17);
+        return true;
+    }));
+    const std::string url = "https://127.0.0.1:" + port;
+    for (const std::string& bundle : {dir + "/cert.pem", std::string()}) {
+        SCOPED_TRACE(bundle);
+        HttpRequest request;
+        request.url = url + "/";
+        request.caBundle = bundle;
+        HttpResponse response;
+        std::string why;
+        EXPECT_EQ(Send(request, response, why), !bundle.empty()) << why;
+        EXPECT_EQ(why.find("certificate") != std::string::npos, bundle.empty()) << why;
+
+        // The store's PUT: s_server answers none, but only without the bundle is the
+        // certificate the problem.
+        LogCapture capture;
+        S3StoreConfig config;
+        ASSERT_TRUE(S3StoreConfig::Parse(url, config, why));
+        config.caBundle = bundle;
+        config.retry.attempts = 1;
+        config.lowSpeedTimeS = 1;  // s_server may never answer the PUT
+        const std::string body = "abc";
+        ObjectToStore object;
+        object.bucket = "rec";
+        object.key = "k.ts";
+        object.data = reinterpret_cast<const uint8_t*>(body.data());
+        object.size = body.size();
+        FileTransferInfo info;
+        S3Store(config).Put(object, {"ak", "sk", "tok", "us-east-1", false}, &info);
+        size_t certificateLines = 0;
+        for (const auto& message : capture.Messages())
+            certificateLines += message.find("certificate") != std::string::npos;
+        EXPECT_EQ(certificateLines > 0, bundle.empty());
+    }
 }
