@@ -26,6 +26,9 @@
 #include "platform/framework/SampleClock.h"
 #include "platform/framework/StopSignal.h"
 
+struct AVPacket;
+struct AVStream;
+
 class MediaInput {
   public:
     // A live input that delivers no packet for this long is given up (and reopened).
@@ -76,6 +79,21 @@ class MediaInput {
     struct State;  // the FFmpeg objects
     static int interrupted(void* opaque);
     void armSilenceDeadline();
+
+    // Steps of Open, in order; each false with the reason in `error`. `shown` is the URL as
+    // log lines and errors may show it.
+    bool allocate(std::string* error);
+    bool openDemuxer(const std::string& shown, std::string* error);
+    bool selectTracks(const std::string& shown, std::string* error);
+    bool selectTrack(unsigned index, SampleClock::Track role, std::string* error);
+    bool setUpAnnexBFilter(const AVStream& stream, std::string* error);
+
+    // Steps of Read. Each returns kPacket to go on, with `*out` the next packet (owned by the
+    // caller) or left null when this step yielded none; any other status ends the Read.
+    Status takeFiltered(AVPacket** out, std::string* error);
+    Status takeDemuxed(SampleClock::Track* role, AVPacket** out, std::string* error);
+    // Hands `out` over to `packet` (which then owns it); false when it holds no bytes.
+    bool fill(Packet* packet, SampleClock::Track role, AVPacket* out);
 
     std::string url_;
     bool live_;
