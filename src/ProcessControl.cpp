@@ -6,6 +6,7 @@
 
 #include "platform/framework/StreamData.h"
 #include "platform/logger/Logger.h"
+#include "platform/transfer/StoreSettings.h"
 #include "src/AwsInfo.h"
 #include "src/FileRecorderModule.h"
 
@@ -62,6 +63,43 @@ bool ProcessControl::getArgument(ModuleSettings& settings) {
     return true;
 }
 
+bool ProcessControl::checkSettings(const ModuleSettings& settings) {
+    constexpr const char* fn = "Orvane::ProcessControl::checkSettings";
+    if (settings.uploadInterval < 1) {
+        Logger::Put(4, kFile, fn, __LINE__, "-uploadinterval must be at least 1 (seconds), got %d",
+                    settings.uploadInterval);
+        return false;
+    }
+    std::string why;
+    if (!CheckStoreSettings(Options(), settings.bucketName, settings.streamingId, &why)) {
+        Logger::Put(4, kFile, fn, __LINE__, "%s", why.c_str());
+        return false;
+    }
+    return true;
+}
+
+std::vector<OptionHelp> ProcessControl::RecorderOptions() {
+    return {
+        {"bucketname", "NAME", "", "the bucket (or the directory under a file:// endpoint)"},
+        {"uploadinterval", "SECONDS", "", "stream per object, at least 1"},
+        {"authretrytime", "MS", "", "how long to wait for credentials after asking for them"},
+        {"bufferfullsize", "N", "", "upload intervals of stream held while the store lags"},
+        {"kct", "h264|h265", "", "the input's video codec"},
+        {"s3accel", "true|false", "false", "use S3 transfer acceleration"},
+        {"startignoretime", "MS", "0", "stream skipped after the first sample"},
+    };
+}
+
+bool ProcessControl::checkInput(const InputInfo& input) {
+    const char* expected = settings_.codecType == 0 ? "H.264" : "H.265";
+    if (input.videoCodec == expected) return true;
+    std::string kct;
+    GetArgument_str("-kct", kct, "");
+    Logger::Put(4, kFile, "Orvane::ProcessControl::checkInput", __LINE__,
+                "-kct %s but the input's video is %s", kct.c_str(), input.videoCodec.c_str());
+    return false;
+}
+
 bool ProcessControl::initializeProcess(std::string) {
     // A module whose workers run is never dropped: replacing it would destroy running threads.
     if (module_ && threadsStarted_) {
@@ -69,7 +107,7 @@ bool ProcessControl::initializeProcess(std::string) {
                     "initializeProcess while the module runs: the running module is kept.");
         return false;
     }
-    if (!getArgument(settings_)) return false;
+    if (!getArgument(settings_) || !checkSettings(settings_)) return false;
     streamingId_ = settings_.streamingId;
     if (module_) module_->OnStop();  // a stopped module may still have a connected pipeline
     module_ = std::make_shared<FileRecorderModule>();

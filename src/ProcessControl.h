@@ -38,6 +38,11 @@ class ProcessControl : public BaseProcess, public INotifyObserver {
     // the host disconnects; what the deadline leaves is dropped by the disconnection, and the
     // log says how much.
     bool drainProcess(int64_t timeoutMs) override;
+    // The seven recorder options, for the usage text.
+    static std::vector<OptionHelp> RecorderOptions();
+    std::vector<OptionHelp> moduleOptions() const override { return RecorderOptions(); }
+    // Refuses an input whose video codec is not the one -kct names.
+    bool checkInput(const InputInfo& input) override;
 
     void notifyVideoData(std::shared_ptr<ReceivedSample> sample) override;
     void notifyAudioData(std::shared_ptr<ReceivedSample> sample) override;
@@ -57,6 +62,9 @@ class ProcessControl : public BaseProcess, public INotifyObserver {
 
   private:
     bool getArgument(ModuleSettings& settings);
+    // Settings that read well but can never record: an upload interval below 1 s, a store that
+    // cannot take the bucket, endpoint or keys. False after one line that says why.
+    bool checkSettings(const ModuleSettings& settings);
     bool setAuthenticationInfo(const std::map<std::string, std::string>& properties);
 
     std::atomic<bool> running_{false};  // between startProcess and a stop, disconnection or error

@@ -447,20 +447,40 @@ TEST(EndToEndTest, SigintEndsARunInOrderWithExitCodeZero) {
     EXPECT_LT(objects.size(), 4u);
 }
 
-TEST(EndToEndTest, InputsThatCannotBeRecordedEndWithStatusOne) {
+// Inputs the recorder cannot take end the start (status 1); a store that refuses every file
+// makes the run end with status 3 after the drain, saying why.
+TEST(EndToEndTest, RunsThatCannotRecordEndWithTheirStatus) {
     const std::string dir = Scratch("bad");
+    const std::string endpoint = Store(dir);
+    // The stream's directory in the bucket is a file: every object is refused as a path error.
+    std::ofstream(dir + "/store/rec/e2e_short") << "in the way";
     const struct {
-        std::string input, says;
-    } cases[] = {{dir + "/missing.mp4", "cannot open input \"" + dir + "/missing.mp4\""},
-                 {MediaClip("e2e_audio_only.m4a", Words("-f lavfi -i sine=duration=1 -c:a aac")),
-                  "has no H.264 or H.265 video"}};
+        std::string input;
+        Args extra;
+        int status;
+        std::string says;
+    } cases[] = {
+        {dir + "/missing.mp4", {}, 1, "cannot open input \"" + dir + "/missing.mp4\""},
+        {MediaClip("e2e_audio_only.m4a", Words("-f lavfi -i sine=duration=1 -c:a aac")),
+         {},
+         1,
+         "has no H.264 or H.265 video"},
+        {ShortClip(), {"-kct", "h265"}, 1, "-kct h265 but the input's video is H.264"},
+        {ShortClip(), Words("-readrate 20 -bufferfullsize 1 -draintimeout 1"), 3,
+         "nothing was stored: all "},
+    };
     for (const auto& c : cases) {
-        auto r = RunProcess(RecorderArgs(c.input, dir, {"-endpoint", "file://" + dir}), 60000);
-        EXPECT_EQ(r.exitStatus, 1);
+        SCOPED_TRACE(c.says);
+        fs::remove(dir + "/log.txt");
+        auto r =
+            RunProcess(RecorderArgs(c.input, dir, Args{"-endpoint", endpoint} + c.extra), 60000);
+        EXPECT_EQ(r.exitStatus, c.status);
         const std::string log = ReadFile(dir + "/log.txt");
-        EXPECT_NE(log.find(c.says), std::string::npos) << log;
-        EXPECT_NE(log.find("Initialize Error."), std::string::npos);
+        EXPECT_NE(log.find(c.says), std::string::npos) << log.substr(0, 5000);
+        EXPECT_EQ(log.find("Initialize Error.") != std::string::npos, c.status == 1);
     }
+    EXPECT_NE(ReadFile(dir + "/log.txt").find("files were given up (last error: FilePathError)"),
+              std::string::npos);
 }
 
 TEST(EndToEndTest, SourceClockJumpsNeverMakeAGarbageDuration) {

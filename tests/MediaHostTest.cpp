@@ -10,6 +10,7 @@
 #include <mutex>
 #include <thread>
 
+#include "platform/framework/Credentials.h"
 #include "platform/framework/MediaHost.h"
 #include "platform/logger/LogCapture.h"
 #include "tests/support/ClipSamples.h"
@@ -240,17 +241,23 @@ TEST(MediaHostTest, ReadRatePacesAFileDurationEndsItStopEndsItEarly) {
     EXPECT_GE(StreamData(seen.video.back()).timestamp, 1400u);
     EXPECT_EQ(seen.events.back(), "disconnect");
 
-    HostRun slow(Args(clip, "-readrate 0.1 -endpoint file:///tmp"));
-    std::thread stopper([&] {
-        testsupport::WaitUntil([&] { return !slow.process->Snapshot().video.empty(); }, 30000);
-        slow.host->Stop();
-    });
-    start = std::chrono::steady_clock::now();
-    seen = slow.Run();
-    stopper.join();
-    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(20));
-    EXPECT_EQ(std::vector<std::string>(seen.events.end() - 2, seen.events.end()),
-              Words("drain disconnect"));
+    // Stopped by the user, or by the module's error state: reading stops, the rest is drained.
+    for (bool moduleError : {false, true}) {
+        HostRun slow(Args(clip, "-readrate 0.1 -endpoint file:///tmp"));
+        std::thread stopper([&] {
+            testsupport::WaitUntil([&] { return !slow.process->Snapshot().video.empty(); }, 30000);
+            moduleError ? slow.process->SetProcessStatus(Error, 21) : slow.host->Stop();
+        });
+        start = std::chrono::steady_clock::now();
+        seen = slow.Run();
+        stopper.join();
+        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(20));
+        EXPECT_EQ(std::vector<std::string>(seen.events.end() - 2, seen.events.end()),
+                  Words("drain disconnect"));
+        const auto outcome = slow.process->RunOutcome();
+        EXPECT_EQ(outcome.status, moduleError ? kExitModuleError : kExitNormal);
+        EXPECT_EQ(outcome.why, moduleError ? "recorder stopped: module error 21" : "");
+    }
 }
 
 TEST(MediaHostTest, CredentialsFromProcessEnvironmentOrNone) {
@@ -262,17 +269,14 @@ TEST(MediaHostTest, CredentialsFromProcessEnvironmentOrNone) {
         noSts("AWS_ENDPOINT_URL_STS", "http://127.0.0.1:9");
     const auto common =
         Args(clip, "-readrate 0 -duration 0.2 -endpoint http://127.0.0.1:9 -region eu-west-3");
-    {  // None at all: logged plainly, nothing delivered, not even on a token request.
+    {  // None at all: logged plainly, nothing delivered.
         LogCapture capture;
-        HostRun run(common);
-        run.Run();
-        run.host->OnTokenRequest(GetAWSSecureTokenRequest());
-        EXPECT_TRUE(run.process->Snapshot().properties.empty());
+        EXPECT_TRUE(HostRun(common).Run().properties.empty());
         EXPECT_EQ(CountContaining(capture,
                                   "no AWS_ACCESS_KEY_ID, AWS_SECRET_ACCESS_KEY, AWS_SESSION_TOKEN"),
-                  2u);
+                  1u);
     }
-    {  // A credential process: asked after the connection reply and on every token request.
+    {  // A credential process: asked after the connection reply and again on every fetch.
         LogCapture capture;
         const std::string counter = testsupport::BuildPath("mh-count-" + std::to_string(getpid()));
         unlink(counter.c_str());
@@ -284,11 +288,10 @@ TEST(MediaHostTest, CredentialsFromProcessEnvironmentOrNone) {
                                                 "\"AKID%s\",\"SecretAccessKey\":\"s3cr3t-value\","
                                                 "\"SessionToken\":\"tok\"}' $n\n")});
         HostRun run(args);
-        run.Run();
-        run.host->OnTokenRequest(GetAWSSecureTokenRequest());
-        auto props = run.process->Snapshot().properties;
-        ASSERT_EQ(props.size(), 2u);
+        auto props = run.Run().properties;
+        ASSERT_EQ(props.size(), 1u);
         EXPECT_EQ(props[0].at("awsAccessKey"), "AKID1");
+        props.push_back(credentials::Fetch(run.process->Options()).properties);
         EXPECT_EQ(props[1].at("awsAccessKey"), "AKID2");  // asked again, not cached
         EXPECT_EQ(props[1].at("awsSecretKey"), "s3cr3t-value");
         EXPECT_EQ(props[1].at("sessionToken"), "tok");

@@ -1,5 +1,7 @@
 #include "platform/framework/BaseProcess.h"
 
+#include <set>
+
 #include "platform/logger/Logger.h"
 
 namespace {
@@ -28,10 +30,17 @@ std::shared_ptr<IModuleHost> BaseProcess::hostSnapshot() {
 }
 
 bool BaseProcess::Initialize() {
+    constexpr const char* fn = "BaseProcess::Initialize";
     // The module's option messages come first: they are what a user most often gets wrong.
-    if (!initializeProcess(std::string())) return false;
+    const bool moduleReady = initializeProcess(std::string());
+    std::set<std::string> known;
+    for (const auto& o : FrameworkOptions::Help()) known.insert(o.name);
+    for (const auto& o : moduleOptions()) known.insert(o.name);
+    const std::vector<std::string> faults = commandLine_.CheckShape(known);
+    for (const auto& fault : faults) Logger::Put(4, kFile, fn, __LINE__, "%s", fault.c_str());
+    if (!moduleReady || !faults.empty()) return false;
     for (const auto& error : optionErrors_) {
-        Logger::Put(4, kFile, "BaseProcess::Initialize", __LINE__, "bad option: %s", error.c_str());
+        Logger::Put(4, kFile, fn, __LINE__, "bad option: %s", error.c_str());
     }
     if (!optionErrors_.empty()) return false;
     if (!status_.Open(options_.statusPath)) {
@@ -65,6 +74,21 @@ bool BaseProcess::Execute() {
     notifyInputOutputDisconnectionRequest(request);
     stopProcess();
     return true;
+}
+
+BaseProcess::Outcome BaseProcess::RunOutcome() {
+    std::lock_guard<std::mutex> lock(mutex_);
+    Outcome outcome;
+    if (state_ == Error) {
+        outcome.status = kExitModuleError;
+        outcome.why = "recorder stopped: module error " + std::to_string(code_);
+    } else if (storedFiles_ == 0 && givenUpFiles_ > 0) {
+        outcome.status = kExitNothingStored;
+        outcome.why = "nothing was stored: all " + std::to_string(givenUpFiles_) +
+                      " stream files were given up (last error: " +
+                      (lastError_.empty() ? std::string("none named") : lastError_) + ")";
+    }
+    return outcome;
 }
 
 void BaseProcess::Uninitialize() {
@@ -133,6 +157,20 @@ VqResult BaseProcess::SendGetAWSTokenRequest(const std::string& destination,
 VqResult BaseProcess::SendLastSequenceNumNotify(const std::string& destination,
                                                 LastSequenceNumNotify& message) {
     status_.WriteLastSequenceNumNotify(destination, message);
+    {
+        std::lock_guard<std::mutex> lock(mutex_);
+        for (const auto& entry : message.entries) {
+            if (entry.succeeded) {
+                ++storedFiles_;
+            } else {
+                ++givenUpFiles_;
+                // A file dropped because the buffer was over its limit says less than the
+                // transfer error that kept the files in the buffer.
+                if (lastError_.empty() || entry.errorName != "BufferOver")
+                    lastError_ = entry.errorName;
+            }
+        }
+    }
     if (auto host = hostSnapshot()) host->OnLastSequenceNumNotify(message);
     return VQ_OK;
 }
@@ -172,5 +210,13 @@ bool BaseProcess::setProperties(std::map<std::string, std::string>&) {
 }
 
 bool BaseProcess::drainProcess(int64_t) {
+    return true;
+}
+
+std::vector<OptionHelp> BaseProcess::moduleOptions() const {
+    return {};
+}
+
+bool BaseProcess::checkInput(const InputInfo&) {
     return true;
 }

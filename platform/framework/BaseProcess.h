@@ -4,11 +4,13 @@
 //   constructor  reads the framework's log options so that the first log line already goes
 //                where the user asked;
 //   Initialize() reads the framework's options, calls initializeProcess (the module's own
-//                options come first), opens the status output, then prepares the host; false
-//                if any step fails;
+//                options come first), checks that the command line holds only known options
+//                with values, opens the status output, then prepares the host; false if any
+//                step fails;
 //   Execute()    startProcess, then the host's Run (connection reply, credentials, samples),
 //                then the disconnection request and stopProcess;
 //   Uninitialize().
+// Outcome() then tells how the run ended, as the process's exit status.
 // Hooks are virtual and public so that a host (and a test) can deliver messages. The sample
 // hooks are called on the host's receive threads, concurrently with the message hooks.
 // Status and send calls are safe for concurrent callers.
@@ -19,6 +21,7 @@
 #include <memory>
 #include <mutex>
 #include <string>
+#include <vector>
 
 #include "platform/framework/FrameworkOptions.h"
 #include "platform/framework/ModuleHost.h"
@@ -26,6 +29,19 @@
 #include "platform/framework/StatusWriter.h"
 #include "platform/framework/VqMessages.h"
 #include "platform/framework/VqResult.h"
+
+// The process's exit statuses.
+enum ExitStatus : int {
+    kExitNormal = 0,
+    kExitStartFailed = 1,    // Initialize failed: options, input, store settings
+    kExitModuleError = 2,    // the module reported the error state
+    kExitNothingStored = 3,  // stream files were given up and none was stored
+};
+
+// What the host learnt of the input once it is open, for BaseProcess::checkInput.
+struct InputInfo {
+    std::string videoCodec;  // "H.264" or "H.265"
+};
 
 class IVqModuleMessageObserver {
   public:
@@ -64,6 +80,15 @@ class BaseProcess : public IVqModuleMessageObserver,
     bool Execute();
     void Uninitialize();
 
+    // How the run ended, after Execute: kExitModuleError when the process state is Error,
+    // kExitNothingStored when the module gave stream files up and stored none, else
+    // kExitNormal; `why` says so in one line ("" for a normal run).
+    struct Outcome {
+        ExitStatus status = kExitNormal;
+        std::string why;
+    };
+    Outcome RunOutcome();
+
     // Installs the host that Initialize prepares and Execute runs; without one, Initialize
     // creates the media host for -input (CreateMediaHost). Call before Initialize.
     void SetHost(std::shared_ptr<IModuleHost> host);
@@ -101,6 +126,12 @@ class BaseProcess : public IVqModuleMessageObserver,
     // stored in time. The host then delivers the disconnection request as usual. The base
     // has nothing to store and returns true at once.
     virtual bool drainProcess(int64_t timeoutMs);
+    // The module's own options, for the usage text and the check for unknown options. Called
+    // on any thread, at any time; the base has none.
+    virtual std::vector<OptionHelp> moduleOptions() const;
+    // The host opened the input (message thread, during Initialize): false, after a log line
+    // that says why, when the module cannot record it. The base accepts every input.
+    virtual bool checkInput(const InputInfo& input);
 
     // Sample hooks (receive threads): the base drops the samples.
     void notifyVideoData(std::shared_ptr<ReceivedSample>) override {}
@@ -115,10 +146,13 @@ class BaseProcess : public IVqModuleMessageObserver,
     std::vector<std::string> optionErrors_;  // framework options that could not be read
     StatusWriter status_;
 
-    std::mutex mutex_;  // guards host_, state_, code_
+    std::mutex mutex_;  // guards host_, state_, code_ and the counts below
     std::shared_ptr<IModuleHost> host_;
     VqProcessState state_ = Initializing;
     unsigned int code_ = 0;
+    uint64_t storedFiles_ = 0;   // sequence entries that succeeded
+    uint64_t givenUpFiles_ = 0;  // sequence entries that did not
+    std::string lastError_;      // errorName of the last entry given up, BufferOver last
 };
 
 // Creates the host that records `options.input`; null (with a log line saying why) when the

@@ -4,7 +4,9 @@
 //     `credential_process` JSON (AccessKeyId, SecretAccessKey, SessionToken, Expiration);
 //   - the environment: AWS_ACCESS_KEY_ID, AWS_SECRET_ACCESS_KEY, AWS_SESSION_TOKEN.
 // Either may give long-term keys (no session token); the chain exchanges those for temporary
-// ones, because the module accepts only temporary credentials (all four values present).
+// ones, because the module accepts only temporary credentials (all four values present). A key,
+// secret or token that holds a control character is refused, so that it can never break a
+// request's header lines.
 //
 // Secrets never reach a log line or an error text: texts name the source and the missing
 // field only.
@@ -41,9 +43,19 @@ awsauth::Lookup FromCredentialProcess(const std::string& command);
 // The environment link: absent when none of the three variables is set.
 awsauth::Lookup FromEnvironment(const awsauth::Environment& environment);
 
-// Runs `command` through /bin/sh, collects its standard output (its standard error goes to
-// ours); false with a reason when it cannot start, exits non-zero, is killed or takes longer
-// than `timeoutMs`.
-bool RunCommand(const std::string& command, int timeoutMs, std::string* output, std::string* why);
+// Runs `command` through /bin/sh in a process group of its own and collects its standard
+// output (its standard error goes to ours). One deadline, `timeoutMs`, covers the output and
+// the exit. The output is complete when the pipe closes, or as soon as it is a whole JSON
+// document once the shell has exited (a helper may leave a background child that holds the
+// pipe). Whatever is left of the group is killed before RunCommand returns: at the deadline,
+// when `cancelFd` (-1: none) becomes readable or StopCommands is called, and after a complete
+// read. False with a reason when it cannot start, exits non-zero, is killed, is stopped or
+// takes too long.
+bool RunCommand(const std::string& command, int timeoutMs, int cancelFd, std::string* output,
+                std::string* why);
+
+// Ends every RunCommand under way (their process groups are killed): the recorder is stopping.
+// Later calls run as usual. Any thread.
+void StopCommands();
 
 }  // namespace credentials

@@ -1,51 +1,7 @@
 #include "platform/framework/FrameworkOptions.h"
 
-#include <cctype>
-#include <cerrno>
-#include <climits>
-#include <cmath>
 #include <cstdlib>
 #include <mutex>
-
-CommandLine::CommandLine(int argc, char** argv) {
-    for (int i = 0; i < argc; ++i) args_.emplace_back(argv[i] ? argv[i] : "");
-}
-
-bool CommandLine::Find(const std::string& name, std::string& value) const {
-    const std::string flag = "-" + name;
-    bool found = false;
-    for (size_t i = 1; i + 1 < args_.size(); ++i) {
-        if (args_[i] == flag) {
-            value = args_[i + 1];
-            found = true;
-            ++i;
-        }
-    }
-    return found;
-}
-
-bool CommandLine::ParseInt(const std::string& text, int& value) {
-    if (text.empty() || text.size() > 64) return false;
-    if (!std::isdigit(static_cast<unsigned char>(text[0])) && text[0] != '-' && text[0] != '+')
-        return false;  // strtoll would skip leading blanks
-    errno = 0;
-    char* end = nullptr;
-    long long parsed = std::strtoll(text.c_str(), &end, 10);
-    if (errno != 0 || end == text.c_str() || *end != '\0') return false;
-    if (parsed < INT_MIN || parsed > INT_MAX) return false;
-    value = static_cast<int>(parsed);
-    return true;
-}
-
-bool CommandLine::ParseDouble(const std::string& text, double& value) {
-    if (text.empty() || text.size() > 64) return false;
-    errno = 0;
-    char* end = nullptr;
-    double parsed = std::strtod(text.c_str(), &end);
-    if (errno != 0 || end == text.c_str() || *end != '\0' || !std::isfinite(parsed)) return false;
-    value = parsed;
-    return true;
-}
 
 namespace {
 
@@ -72,6 +28,18 @@ std::string baseName(const std::string& input) {
     return out.empty() ? std::string("stream") : out;
 }
 
+// Why `region` cannot name a region in a signed request, or "" when it can. A region travels
+// in the host name and the signature's scope: a control character would break the request's
+// lines, a space or '/' the scope.
+std::string regionFault(const std::string& region) {
+    for (unsigned char c : region) {
+        if (c < 0x20 || c == 0x7f) return "holds a control character";
+        if (c == ' ') return "holds a space";
+        if (c == '/') return "holds a '/'";
+    }
+    return region.empty() ? "is empty" : "";
+}
+
 std::mutex g_optionsMutex;
 FrameworkOptions g_options;
 
@@ -90,6 +58,7 @@ FrameworkOptions FrameworkOptions::Read(const CommandLine& cl, std::vector<std::
         }
         field = parsed;
     };
+    o.input = envOr("SFR_INPUT_URL", "");
     cl.Find("input", o.input);
     o.streamingId = o.input.empty() ? std::string() : baseName(o.input);
     cl.Find("streamingid", o.streamingId);
@@ -100,7 +69,16 @@ FrameworkOptions FrameworkOptions::Read(const CommandLine& cl, std::vector<std::
     o.endpoint = envOr("AWS_ENDPOINT_URL_S3", envOr("AWS_ENDPOINT_URL", ""));
     cl.Find("endpoint", o.endpoint);
     o.region = envOr("AWS_REGION", envOr("AWS_DEFAULT_REGION", "us-east-1"));
-    cl.Find("region", o.region);
+    const bool regionGiven = cl.Find("region", o.region);
+    if (std::string fault = regionFault(o.region); !fault.empty()) {
+        // The value itself may hold the control character: it is not shown.
+        errors.push_back(std::string("the region from ") +
+                         (regionGiven                        ? "-region"
+                          : !envOr("AWS_REGION", "").empty() ? "AWS_REGION"
+                                                             : "AWS_DEFAULT_REGION") +
+                         " " + fault);
+        o.region = "us-east-1";
+    }
     cl.Find("credentialprocess", o.credentialProcess);
     cl.Find("segmentformat", o.segmentFormat);
     if (o.segmentFormat != "ts") {
@@ -116,6 +94,30 @@ FrameworkOptions FrameworkOptions::Read(const CommandLine& cl, std::vector<std::
     cl.Find("status", o.statusPath);
     o.upload = UploadOptions::Read(cl, errors);
     return o;
+}
+
+std::vector<OptionHelp> FrameworkOptions::Help() {
+    return {
+        {"input", "URL", "SFR_INPUT_URL",
+         "the stream to record: a file, or any URL FFmpeg opens (rtsp://, srt://, udp://, "
+         "rtmp://, http(s)://)"},
+        {"streamingid", "ID", "the input's base name", "the stream's name in keys and messages"},
+        {"endpoint", "URL", "AWS_ENDPOINT_URL_S3, AWS_ENDPOINT_URL, else AWS",
+         "where objects go: https://host[:port], http://127.0.0.1:port, or file:///dir"},
+        {"region", "R", "AWS_REGION, AWS_DEFAULT_REGION, else us-east-1", "the bucket's region"},
+        {"credentialprocess", "CMD", "none",
+         "command that prints AWS credential_process JSON (else AWS_ACCESS_KEY_ID, "
+         "AWS_SECRET_ACCESS_KEY, AWS_SESSION_TOKEN)"},
+        {"keyprefix", "P", "empty", "prefix of every object key"},
+        {"segmentformat", "ts", "ts", "object format"},
+        {"readrate", "R", "1 for files", "pace a file at R times real time; 0 reads at once"},
+        {"duration", "S", "none", "end after S seconds of input"},
+        {"draintimeout", "S", "30", "at the end, store what is held for at most S seconds"},
+        {"parent", "NAME", "host", "destination of every message"},
+        {"status", "PATH", "stdout", "where the messages go, one JSON object per line"},
+        {"logfile", "PATH", "stderr", "log destination"},
+        {"loglevel", "N", "11", "log lines with a priority number above N are not written"},
+    };
 }
 
 const FrameworkOptions& CurrentFrameworkOptions() {

@@ -1,30 +1,20 @@
 // FrameworkOptions: the framework's own command-line options (the module's options are read
 // by the module through BaseProcess::GetArgument_*).
 //
-// Options are `-name value` pairs; when one is given twice the last one wins.
+// Options are `-name value` pairs; when one is given twice the last one wins. The input may
+// also come from the environment variable SFR_INPUT_URL, so that a URL with a password need not
+// stand in the process list.
 #pragma once
 
 #include <string>
 #include <vector>
 
+#include "platform/framework/CommandLine.h"
 #include "platform/framework/UploadOptions.h"
-
-// Reads `-name value` pairs out of argv. Thread-safe after construction (read-only).
-class CommandLine {
-  public:
-    CommandLine(int argc, char** argv);
-    // True and the value when `-name` is given with a value.
-    bool Find(const std::string& name, std::string& value) const;
-    // Whole decimal number within int range; false when absent or not a number.
-    static bool ParseInt(const std::string& text, int& value);
-    static bool ParseDouble(const std::string& text, double& value);
-
-  private:
-    std::vector<std::string> args_;
-};
+#include "platform/framework/Usage.h"
 
 struct FrameworkOptions {
-    std::string input;                 // -input: file or URL to record; empty: none
+    std::string input;                 // -input or SFR_INPUT_URL: file or URL; empty: none
     std::string streamingId;           // -streamingid, default: the input's base name
     std::string parent = "host";       // -parent: destination of every message
     double readRate = -1;              // -readrate: <0 default (1 for files)
@@ -40,9 +30,11 @@ struct FrameworkOptions {
     std::string statusPath = "-";      // -status, "-": stdout
     UploadOptions upload;              // -sse, -storageclass, -acl, -tagging, -addressing, ...
 
-    // Reads every option; problems (unreadable numbers) are appended to `errors`, and the
-    // option keeps its default.
+    // Reads every option; problems (unreadable numbers, a region that cannot go into a
+    // request) are appended to `errors`, one sentence each, and the option keeps its default.
     static FrameworkOptions Read(const CommandLine& commandLine, std::vector<std::string>& errors);
+    // Every framework option with its value, default and meaning, for the usage text.
+    static std::vector<OptionHelp> Help();
 };
 
 // The options of the running process, set once by BaseProcess's constructor; the transfer

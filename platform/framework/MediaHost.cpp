@@ -32,11 +32,17 @@ MediaHost::MediaHost(FrameworkOptions options, bool handleSignals)
       live_(MediaInput::IsLive(options_.input)),
       handleSignals_(handleSignals),
       shownInput_(MediaInput::Redacted(options_.input)),
-      credentials_(std::make_unique<HostCredentials>(options_)) {}
+      credentials_(std::make_unique<HostCredentials>(options_)),
+      tokens_(
+          [this] {
+              if (process_) deliverCredentials(*process_, "on a token request", true);
+          },
+          [] { credentials::StopCommands(); }) {}
 
 MediaHost::~MediaHost() {
     Stop();
     if (receiver_.joinable()) receiver_.join();
+    tokens_.Stop();
 }
 
 void MediaHost::Stop() {
@@ -49,6 +55,10 @@ bool MediaHost::Prepare(BaseProcess& process) {
     std::string error;
     if (!input_->Open(&error)) {
         Logger::Put(4, kFile, "MediaHost::Prepare", __LINE__, "%s", error.c_str());
+        input_.reset();
+        return false;
+    }
+    if (!process.checkInput(InputInfo{input_->VideoCodec()})) {
         input_.reset();
         return false;
     }
@@ -100,16 +110,35 @@ void MediaHost::Run(BaseProcess& process) {
                     "end of stream: not everything held was stored within %lld ms",
                     static_cast<long long>(timeoutMs));
     }
-    credentials_->Stop();  // nothing is handed over once Run has returned
+    // Nothing is handed over once Run has returned: a credential process still running ends.
+    tokens_.Stop();
+    credentials_->Stop();
     input_.reset();
     // `signals` ends here: from now on a signal takes its previous action again, except that
     // one that arrives while the handlers are still installed counts as the second.
 }
 
 void MediaHost::OnTokenRequest(const GetAWSSecureTokenRequest&) {
-    // The module asks after its credentials were refused (or before it has any): ask the
-    // sources again rather than hand over the same ones.
-    if (process_) deliverCredentials(*process_, "on a token request", true);
+    // The module asks after its credentials were refused (or before it has any): the answer
+    // asks the sources again rather than hand over the same ones.
+    tokens_.Request();
+}
+
+void MediaHost::OnLastSequenceNumNotify(const LastSequenceNumNotify& message) {
+    for (const auto& entry : message.entries) {
+        if (entry.succeeded) {
+            tokens_.ObjectStored();
+            return;
+        }
+    }
+}
+
+void MediaHost::OnProcessStatus(VqProcessState state, unsigned int code) {
+    if (state != Error || moduleFailed_.exchange(true)) return;
+    Logger::Put(5, kFile, "MediaHost::OnProcessStatus", __LINE__,
+                "module error %u: the input is no longer read; storing what is held, then ending",
+                code);
+    Stop();
 }
 
 void MediaHost::deliverCredentials(BaseProcess& process, const char* occasion, bool refresh) {

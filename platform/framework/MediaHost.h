@@ -15,10 +15,12 @@
 //   4. asks the module to store what it holds (drainProcess with `-draintimeout`) and
 //      returns; Execute then delivers the disconnection request. A second SIGINT/SIGTERM ends the
 //      process at once (SignalHandling).
-// OnTokenRequest (upload thread) answers every token request with setProperties, holding no
-// lock of its own while it calls into the module. Credentials come from HostCredentials, which
+// Token requests (upload thread) are answered with setProperties by a TokenResponder, paced
+// after the first, so that refused credentials do not turn into a storm; an object stored (a
+// successful sequence entry) resets the pacing. Credentials come from HostCredentials, which
 // also hands over renewed ones before the current ones expire, on its own thread, until Run
-// returns.
+// returns; a credential process still running then is ended. When the module reports the
+// error state the host stops reading as on SIGINT: the run drains and ends.
 //
 // The attribute block of each sample: rtpTime / attribute2 the presentation / decode time in
 // the track's media clock (90 kHz for video and meta, the sample rate for audio), timestamp the
@@ -28,6 +30,7 @@
 // its track from 0.
 #pragma once
 
+#include <atomic>
 #include <memory>
 #include <string>
 #include <thread>
@@ -37,6 +40,7 @@
 #include "platform/framework/MediaInput.h"
 #include "platform/framework/SampleClock.h"
 #include "platform/framework/StopSignal.h"
+#include "platform/framework/TokenResponder.h"
 
 class MediaHost : public IModuleHost {
   public:
@@ -54,6 +58,8 @@ class MediaHost : public IModuleHost {
     bool Prepare(BaseProcess& process) override;
     void Run(BaseProcess& process) override;
     void OnTokenRequest(const GetAWSSecureTokenRequest& request) override;
+    void OnLastSequenceNumNotify(const LastSequenceNumNotify& message) override;
+    void OnProcessStatus(VqProcessState state, unsigned int code) override;
 
     // Ends the run as the first SIGINT does (any thread, also before Run).
     void Stop();
@@ -87,4 +93,6 @@ class MediaHost : public IModuleHost {
     // Renews credentials before they expire on a thread of its own, from the connection reply
     // until Run ends.
     std::unique_ptr<HostCredentials> credentials_;
+    std::atomic<bool> moduleFailed_{false};  // the module reported the error state
+    TokenResponder tokens_;  // answers on a thread of its own; stopped by Run and the destructor
 };

@@ -236,6 +236,11 @@ bool MediaInput::setUpAnnexBFilter(const AVStream& stream, std::string* error) {
     return true;
 }
 
+const char* MediaInput::VideoCodec() const {
+    const auto& video = state_->tracks[SampleClock::kVideo].description;
+    return video && video->codecName == avcodec_get_name(AV_CODEC_ID_HEVC) ? "H.265" : "H.264";
+}
+
 MediaInput::Status MediaInput::Read(Packet* packet, std::string* error) {
     while (!stop_.Raised()) {
         SampleClock::Track role = SampleClock::kVideo;

@@ -66,6 +66,9 @@ class MediaInput {
     bool Open(std::string* error);
     Status Read(Packet* packet, std::string* error);
 
+    // The video's codec as people write it, "H.264" or "H.265"; valid after a successful Open.
+    const char* VideoCodec() const;
+
     // When the input began, µs since the Unix epoch: the source's own real start time when it
     // gives one (RTSP with RTCP sender reports), else the wall clock at Open.
     int64_t RealStartMicros() const { return realStartMicros_; }

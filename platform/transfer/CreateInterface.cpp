@@ -15,6 +15,7 @@
 #include "platform/transfer/S3Store.h"
 #include "platform/transfer/SegmentFormat.h"
 #include "platform/transfer/SegmentTransfer.h"
+#include "platform/transfer/StoreSettings.h"
 
 namespace {
 
@@ -38,39 +39,12 @@ bool startsWithNoCase(const std::string& text, const std::string& prefix) {
     return true;
 }
 
-// "file:///dir" or "file://localhost/dir" → "/dir" (percent-decoded, trailing '/' removed).
-// False for a relative path, another host, a query or fragment, or a bad escape.
-bool parseFileUrl(const std::string& url, std::string* directory) {
-    std::string rest = url.substr(7);  // after "file://"
-    if (startsWithNoCase(rest, "localhost/")) rest = rest.substr(9);
-    if (rest.empty() || rest[0] != '/' || rest.find_first_of("?#") != std::string::npos)
-        return false;
-    std::string path;
-    for (size_t i = 0; i < rest.size(); ++i) {
-        if (rest[i] != '%') {
-            path.push_back(rest[i]);
-            continue;
-        }
-        if (i + 2 >= rest.size() || !std::isxdigit(static_cast<unsigned char>(rest[i + 1])) ||
-            !std::isxdigit(static_cast<unsigned char>(rest[i + 2])))
-            return false;
-        char c = static_cast<char>(std::stoi(rest.substr(i + 1, 2), nullptr, 16));
-        if (c == '\0') return false;
-        path.push_back(c);
-        i += 2;
-    }
-    while (path.size() > 1 && path.back() == '/') path.pop_back();
-    *directory = path;
-    return true;
-}
-
 // A file URL: a local directory store, when the keys of this stream can stay inside a bucket
 // directory (a key prefix or stream id with "." or ".." parts would lead outside).
 std::shared_ptr<IObjectStore> createLocalStore(const FrameworkOptions& options,
                                                const SegmentFormat& format) {
     std::string directory;
-    if (!startsWithNoCase(options.endpoint, "file://") ||
-        !parseFileUrl(options.endpoint, &directory)) {
+    if (!ParseFileEndpoint(options.endpoint, &directory)) {
         Logger::Put(4, kFile, kFunction, __LINE__,
                     "endpoint \"%s\" is not a usable file URL (file:///absolute/directory)",
                     withoutUserInfo(options.endpoint).c_str());

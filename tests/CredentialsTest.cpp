@@ -1,0 +1,112 @@
+// Credentials for the standalone host: a credential process cannot wedge the recorder (one
+// deadline, its whole process group ended, a helper's background child does not hold the read
+// open), and no key, token or region that could break a request line gets through.
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <stdlib.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+#include <thread>
+
+#include "platform/framework/Credentials.h"
+#include "tests/support/TestSupport.h"
+
+namespace {
+
+using testsupport::ReadFile;
+
+// True once process `pid` is gone (or a zombie waiting for a parent that is not us).
+bool Gone(const std::string& pidText) {
+    const std::string stat =
+        ReadFile("/proc/" + std::to_string(std::atoi(pidText.c_str())) + "/stat");
+    return stat.empty() || stat.find(") Z") != std::string::npos;
+}
+
+TEST(CredentialsTest, CredentialProcessIsBoundedAndLeavesNoProcessBehind) {
+    const std::string pidFile =
+        testsupport::BuildPath("cred-child-" + std::to_string(getpid()) + ".pid");
+    const std::string json =
+        "printf '{\"AccessKeyId\":\"A\",\"SecretAccessKey\":\"S\",\"SessionToken\":\"T\"}'";
+    const struct {
+        std::string command;
+        int timeoutMs;
+        bool cancelled, ok;
+        std::string why;
+    } cases[] = {
+        // The JSON is complete and the shell has exited: read although the pipe stays open.
+        {json + "; sleep 600 & echo $! > " + pidFile, 60000, false, true, ""},
+        {"sleep 600 & echo $! > " + pidFile + "; wait", 200, false, false,
+         "it took longer than 0 s"},
+        {"sleep 600 & echo $! > " + pidFile + "; wait", 60000, true, false,
+         "the recorder is stopping"},
+        {json + "; exit 3", 60000, false, false, "it exited with status 3"},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.command);
+        unlink(pidFile.c_str());
+        int cancel[2];
+        ASSERT_EQ(pipe(cancel), 0);
+        std::thread canceller([&] {
+            // Cancelled once the child is running.
+            if (!c.cancelled) return;
+            testsupport::WaitUntil([&] { return !ReadFile(pidFile).empty(); }, 30000);
+            EXPECT_EQ(write(cancel[1], "x", 1), 1);
+        });
+        std::string output, why;
+        EXPECT_EQ(credentials::RunCommand(c.command, c.timeoutMs, cancel[0], &output, &why), c.ok)
+            << why;
+        canceller.join();
+        EXPECT_EQ(why, c.why);
+        if (c.ok) {
+            EXPECT_NE(output.find("\"SessionToken\":\"T\""), std::string::npos);
+        }
+        // Nothing of the group outlives the call.
+        if (!ReadFile(pidFile).empty()) {
+            EXPECT_TRUE(testsupport::WaitUntil([&] { return Gone(ReadFile(pidFile)); }, 30000));
+        }
+        close(cancel[0]);
+        close(cancel[1]);
+    }
+    unlink(pidFile.c_str());
+}
+
+TEST(CredentialsTest, ControlCharactersInKeysOrTokenAreRefused) {
+    FrameworkOptions options;
+    options.region = "eu-west-1";
+    const struct {
+        const char *key, *secret, *token;  // the environment; null: not set
+        std::string process;               // its AccessKeyId, JSON-escaped; "": no process
+        std::string why;
+    } cases[] = {
+        {"AKID\r\nX-Injected: 1", "s", "t", "", "AWS_ACCESS_KEY_ID holds a control character"},
+        {"AKID", "s\n", "t", "", "AWS_SECRET_ACCESS_KEY holds a control character"},
+        {"AKID", "s", "t\x7f", "", "AWS_SESSION_TOKEN holds a control character"},
+        {nullptr, nullptr, nullptr, "A\\r\\nX-Injected: 1",
+         "its AccessKeyId holds a control character"},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.why);
+        const std::pair<const char*, const char*> environment[] = {
+            {"AWS_ACCESS_KEY_ID", c.key},
+            {"AWS_SECRET_ACCESS_KEY", c.secret},
+            {"AWS_SESSION_TOKEN", c.token}};
+        for (const auto& [name, value] : environment)
+            value ? setenv(name, value, 1) : unsetenv(name);
+        options.credentialProcess =
+            c.process.empty() ? ""
+                              : "printf '{\"AccessKeyId\":\"%s\",\"SecretAccessKey\":\"S\","
+                                "\"SessionToken\":\"T\"}' '" +
+                                    c.process + "'";
+        auto result = credentials::Fetch(options);
+        EXPECT_FALSE(result.ok);
+        EXPECT_NE(result.why.find(c.why), std::string::npos) << result.why;
+        EXPECT_EQ(result.why.find("X-Injected"), std::string::npos);
+    }
+    unsetenv("AWS_ACCESS_KEY_ID");
+    unsetenv("AWS_SECRET_ACCESS_KEY");
+    unsetenv("AWS_SESSION_TOKEN");
+}
+
+}  // namespace
