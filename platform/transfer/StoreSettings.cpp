@@ -8,6 +8,7 @@
 #include "platform/transfer/HttpText.h"
 #include "platform/transfer/ObjectKey.h"
 #include "platform/transfer/S3Store.h"
+#include "platform/transfer/SegmentFormat.h"
 
 namespace {
 
@@ -91,7 +92,10 @@ bool CheckStoreSettings(const FrameworkOptions& options, const std::string& buck
     if (!checkEndpoint(options, bucketName, why)) return false;
     // The longest key of the run: the largest sequence number, a capture time of the same width
     // as any other.
-    const size_t longest = ObjectKey(options.keyPrefix, streamingId, INT32_MAX, 0).size();
+    const SegmentFormat* format = SegmentFormat::Find(options.segmentFormat);
+    const size_t longest = ObjectKey(options.keyPrefix, streamingId, INT32_MAX, 0,
+                                     (format ? *format : SegmentFormat::Ts()).extension)
+                               .size();
     if (longest > kMaxObjectKeyBytes) {
         *why = "-keyprefix and the stream id make object keys of up to " + std::to_string(longest) +
                " bytes; S3 takes at most " + std::to_string(kMaxObjectKeyBytes);
