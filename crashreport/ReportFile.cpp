@@ -12,7 +12,9 @@ namespace Tracewright {
 
 bool ReportFile::Open(const char* path) {
     Close();
-    int fd = open(path, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
+    // Never through a symbolic link at the last component (a link planted beside the
+    // executable would make a crash append to any file), and readable by the group only.
+    int fd = open(path, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NOFOLLOW, 0640);
     if (fd < 0) return false;
     // Another crashing process may be writing its report; wait for it rather than mixing
     // lines. A lock holder that never finishes is ended by the handler's deadline.

@@ -1,11 +1,11 @@
 // ReportFile: the log file a crash report is appended to, written without the heap.
 //
-// Open() appends to the file (created with mode 0644 if absent) and takes an exclusive
-// flock so that reports of processes crashing at the same time beside the same executable do
-// not interleave. Lines are gathered in a fixed buffer and written with write(2); Close()
-// flushes, syncs the data to disk and closes. Write errors are ignored: a report is best
-// effort and must never stop the process from ending. Used only by the thread that holds the
-// crash handler's busy flag.
+// Open() appends to the file (created with mode 0640 if absent, never through a symbolic link at
+// its last component) and takes an exclusive flock so that reports of processes crashing at the
+// same time beside the same executable do not interleave. Lines are gathered in a fixed buffer and
+// written with write(2); Close() flushes, syncs the data to disk and closes. Write errors are
+// ignored: a report is best effort and must never stop the process from ending. Used only by the
+// thread that holds the crash handler's busy flag.
 #pragma once
 
 #include <cstddef>

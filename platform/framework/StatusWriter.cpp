@@ -1,5 +1,8 @@
 #include "platform/framework/StatusWriter.h"
 
+#include <fcntl.h>
+#include <unistd.h>
+
 #include <chrono>
 #include <ctime>
 #include <nlohmann/json.hpp>
@@ -40,8 +43,15 @@ bool StatusWriter::Open(const std::string& path) {
         ownsFile_ = false;
         return true;
     }
-    FILE* f = std::fopen(path.c_str(), "a");
-    if (f == nullptr) return false;
+    // Never through a symbolic link at the last component, and readable by the group only:
+    // the messages name the stream and its objects.
+    int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NOFOLLOW, 0640);
+    if (fd < 0) return false;
+    FILE* f = fdopen(fd, "a");
+    if (f == nullptr) {
+        close(fd);
+        return false;
+    }
     file_ = f;
     ownsFile_ = true;
     return true;

@@ -14,7 +14,8 @@ class StatusWriter {
   public:
     StatusWriter() = default;
     ~StatusWriter();
-    // "-" is stdout. False when the file cannot be opened.
+    // "-" is stdout; a file is appended to, created with mode 0640, and never opened through a
+    // symbolic link at its last component. False when the file cannot be opened.
     bool Open(const std::string& path);
 
     void WriteTokenRequest(const std::string& destination, const GetAWSSecureTokenRequest& m);
