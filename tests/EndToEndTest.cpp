@@ -447,8 +447,9 @@ TEST(EndToEndTest, SigintEndsARunInOrderWithExitCodeZero) {
     EXPECT_LT(objects.size(), 4u);
 }
 
-// Inputs the recorder cannot take end the start (status 1); a store that refuses every file
-// makes the run end with status 3 after the drain, saying why.
+// Inputs the recorder cannot take end the start (status 1); a module error ends the run with
+// status 2; a store that refuses every file makes the run end with status 3 after the drain.
+// Each says why.
 TEST(EndToEndTest, RunsThatCannotRecordEndWithTheirStatus) {
     const std::string dir = Scratch("bad");
     const std::string endpoint = Store(dir);
@@ -466,6 +467,9 @@ TEST(EndToEndTest, RunsThatCannotRecordEndWithTheirStatus) {
          1,
          "has no H.264 or H.265 video"},
         {ShortClip(), {"-kct", "h265"}, 1, "-kct h265 but the input's video is H.264"},
+        // Keys a directory cannot hold: the module reports error 21 at the first transfer.
+        {ShortClip(), Words("-streamingid .. -readrate 20"), 2,
+         "recorder stopped: module error 21"},
         {ShortClip(), Words("-readrate 20 -bufferfullsize 1 -draintimeout 1"), 3,
          "nothing was stored: all "},
     };

@@ -193,9 +193,11 @@ TEST(ProcessEntry, StartThatCannotRecordExitsWithStatusOneAndSaysWhy) {
          "the directory /nonexistent-sfr-store does not exist"},
         {RecorderArgs({"-endpoint", "file:///"}), "the bucket directory /rec does not exist"},
         {RecorderArgs({"-keyprefix", longPrefix}), "make object keys of up to"},
-        {RecorderArgs({"-input", "clip.ts", "-region", "eu-west-1\r\nX-Injected: 1"}),
-         "the region from -region holds a control character"},
-        {RecorderArgs({"-input", "clip.ts", "-region", "eu west"}), "-region holds a space"},
+        {RecorderArgs({"-region", "eu-west-1\r\nX-Injected: 1"}),
+         "the region from -region cannot be used"},
+        {RecorderArgs({"-endpoint", "http://127.0.0.1:9", "-region", "eu west"}),
+         "the region from -region cannot be used"},
+        {with("-bucketname", "My_Recordings"), "-bucketname: bucket name \"My_Recordings\""},
     };
     for (const auto& c : cases) {
         SCOPED_TRACE(c.reason);

@@ -28,18 +28,6 @@ std::string baseName(const std::string& input) {
     return out.empty() ? std::string("stream") : out;
 }
 
-// Why `region` cannot name a region in a signed request, or "" when it can. A region travels
-// in the host name and the signature's scope: a control character would break the request's
-// lines, a space or '/' the scope.
-std::string regionFault(const std::string& region) {
-    for (unsigned char c : region) {
-        if (c < 0x20 || c == 0x7f) return "holds a control character";
-        if (c == ' ') return "holds a space";
-        if (c == '/') return "holds a '/'";
-    }
-    return region.empty() ? "is empty" : "";
-}
-
 std::mutex g_optionsMutex;
 FrameworkOptions g_options;
 
@@ -69,16 +57,10 @@ FrameworkOptions FrameworkOptions::Read(const CommandLine& cl, std::vector<std::
     o.endpoint = envOr("AWS_ENDPOINT_URL_S3", envOr("AWS_ENDPOINT_URL", ""));
     cl.Find("endpoint", o.endpoint);
     o.region = envOr("AWS_REGION", envOr("AWS_DEFAULT_REGION", "us-east-1"));
-    const bool regionGiven = cl.Find("region", o.region);
-    if (std::string fault = regionFault(o.region); !fault.empty()) {
-        // The value itself may hold the control character: it is not shown.
-        errors.push_back(std::string("the region from ") +
-                         (regionGiven                        ? "-region"
-                          : !envOr("AWS_REGION", "").empty() ? "AWS_REGION"
-                                                             : "AWS_DEFAULT_REGION") +
-                         " " + fault);
-        o.region = "us-east-1";
-    }
+    o.regionSource = !envOr("AWS_REGION", "").empty()           ? "AWS_REGION"
+                     : !envOr("AWS_DEFAULT_REGION", "").empty() ? "AWS_DEFAULT_REGION"
+                                                                : "the default";
+    if (cl.Find("region", o.region)) o.regionSource = "-region";
     cl.Find("credentialprocess", o.credentialProcess);
     cl.Find("segmentformat", o.segmentFormat);
     if (o.segmentFormat != "ts") {

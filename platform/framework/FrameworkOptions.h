@@ -22,6 +22,7 @@ struct FrameworkOptions {
     double drainTimeoutSeconds = 30;   // -draintimeout
     std::string endpoint;              // -endpoint or AWS_ENDPOINT_URL_S3 / AWS_ENDPOINT_URL
     std::string region;                // -region or AWS_REGION / AWS_DEFAULT_REGION / us-east-1
+    std::string regionSource;          // where `region` came from, for messages: "-region", ...
     std::string credentialProcess;     // -credentialprocess
     std::string segmentFormat = "ts";  // -segmentformat
     std::string keyPrefix;             // -keyprefix
@@ -30,8 +31,8 @@ struct FrameworkOptions {
     std::string statusPath = "-";      // -status, "-": stdout
     UploadOptions upload;              // -sse, -storageclass, -acl, -tagging, -addressing, ...
 
-    // Reads every option; problems (unreadable numbers, a region that cannot go into a
-    // request) are appended to `errors`, one sentence each, and the option keeps its default.
+    // Reads every option; problems (unreadable numbers) are appended to `errors`, one sentence
+    // each, and the option keeps its default.
     static FrameworkOptions Read(const CommandLine& commandLine, std::vector<std::string>& errors);
     // Every framework option with its value, default and meaning, for the usage text.
     static std::vector<OptionHelp> Help();

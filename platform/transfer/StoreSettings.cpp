@@ -8,6 +8,7 @@
 #include "platform/transfer/HttpText.h"
 #include "platform/transfer/ObjectKey.h"
 #include "platform/transfer/S3Store.h"
+#include "platform/transfer/S3Target.h"
 #include "platform/transfer/SegmentFormat.h"
 
 namespace {
@@ -38,9 +39,22 @@ bool checkEndpoint(const FrameworkOptions& options, const std::string& bucketNam
     if (!startsWithNoCase(options.endpoint, "file:")) {
         S3StoreConfig config;
         std::string fault;
-        if (S3StoreConfig::Parse(options.endpoint, config, fault)) return true;
-        *why = shown + " cannot be used: " + fault;
-        return false;
+        if (!S3StoreConfig::Parse(options.endpoint, config, fault)) {
+            *why = shown + " cannot be used: " + fault;
+            return false;
+        }
+        // Other S3 servers name their buckets as they like; AWS only as its rules allow.
+        const bool aws = options.endpoint.empty();
+        if (aws && !ValidateBucketName(bucketName, fault)) {
+            *why = "-bucketname: " + fault;
+            return false;
+        }
+        if (!ValidateRegion(options.region, aws, fault)) {
+            // The region itself is not shown: it may hold a line break.
+            *why = "the region from " + options.regionSource + " cannot be used: " + fault;
+            return false;
+        }
+        return true;
     }
     std::string directory;
     if (!ParseFileEndpoint(options.endpoint, &directory)) {

@@ -18,9 +18,10 @@ constexpr size_t kMaxObjectKeyBytes = 1024;
 bool ParseFileEndpoint(const std::string& url, std::string* directory);
 
 // True when objects of stream `streamingId` can be stored in bucket `bucketName` through
-// `options` (endpoint, key prefix); otherwise false with one sentence in `why`: an endpoint
-// that cannot be used (scheme, port, relative file path, a directory or bucket directory that
-// does not exist), or keys longer than kMaxObjectKeyBytes. Texts show the endpoint without
+// `options` (endpoint, region, key prefix); otherwise false with one sentence in `why`: an
+// endpoint that cannot be used (scheme, port, relative file path, a directory or bucket
+// directory that does not exist), a bucket name AWS cannot address, a region that cannot go
+// into a request, or keys longer than kMaxObjectKeyBytes. Texts show the endpoint without
 // user information.
 bool CheckStoreSettings(const FrameworkOptions& options, const std::string& bucketName,
                         const std::string& streamingId, std::string* why);
