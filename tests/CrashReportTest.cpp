@@ -331,8 +331,8 @@ TEST(CrashReportRecorder, KillSegvLeavesAReportBesideTheExecutable) {
     // reporter's handler is the only one and the signal goes on to the default action.
     std::string fifo = recorder.Dir() + "/status.fifo";
     ASSERT_EQ(mkfifo(fifo.c_str(), 0600), 0);
-    pid_t pid = recorder.Start({"-bucketname", "b", "-uploadinterval", "10", "-authretrytime", "1",
-                                "-bufferfullsize", "100", "-kct", "h264", "-status", fifo},
+    pid_t pid = recorder.Start({"-bucketname", "rec", "-uploadinterval", "10", "-authretrytime",
+                                "1", "-bufferfullsize", "100", "-kct", "h264", "-status", fifo},
                                {"ASAN_OPTIONS=handle_segv=0"});
     ASSERT_TRUE(WaitUntil([&] { return CatchesSegv(pid, recorder.Program()); }, 30000));
     // Then let it reach the blocking open (the kernel names the wait); where wchan is not

@@ -13,6 +13,7 @@
 #include <chrono>
 #include <filesystem>
 #include <fstream>
+#include <iostream>
 #include <regex>
 #include <sstream>
 #include <string>
@@ -485,6 +486,34 @@ TEST(EndToEndTest, RunsThatCannotRecordEndWithTheirStatus) {
     }
     EXPECT_NE(ReadFile(dir + "/log.txt").find("files were given up (last error: FilePathError)"),
               std::string::npos);
+}
+
+// A secret the server refuses: the stores' pacing and the host's paced token answers keep the
+// PUTs, token requests and log lines few, however long it lasts (here 12 s of live-paced input;
+// without pacing it was hundreds of each per second).
+TEST(EndToEndTest, RefusedSecretMakesNoStormOfRequestsOrLogLines) {
+    using testsupport::ScriptedHttpServer;
+    ScriptedHttpServer server(
+        ScriptedHttpServer::Mode::kRespond,
+        testsupport::S3ErrorAnswer("403 Forbidden", "SignatureDoesNotMatch"));
+    const std::string dir = Scratch("storm");
+    const int seconds = 12;
+    auto r = RunProcess(Words("env AWS_ACCESS_KEY_ID=AKIDTEST AWS_SECRET_ACCESS_KEY=wrong "
+                              "AWS_SESSION_TOKEN=token") +
+                            RecorderArgs(Clip("e2e_12s.ts", seconds, kX264Gop30), dir,
+                                         {"-draintimeout", "1", "-bufferfullsize", "10",
+                                          "-endpoint", server.Endpoint()}),
+                        120000);
+    const std::string log = ReadFile(dir + "/log.txt");
+    EXPECT_EQ(r.exitStatus, 0) << log.substr(0, 3000);
+    const Notified status = ReadStatus(dir + "/status.jsonl");
+    // Per second of input at most about two PUTs, one token request and 3 KB of log.
+    EXPECT_LE(server.Connections(), 2 * seconds);
+    EXPECT_GE(server.Connections(), 2);
+    EXPECT_LE(status.tokenRequests, static_cast<size_t>(seconds));
+    EXPECT_LT(log.size(), 3000u * seconds);
+    std::cout << "refused secret, " << seconds << " s: " << server.Connections() << " PUTs, "
+              << status.tokenRequests << " token requests, " << log.size() << " log bytes\n";
 }
 
 TEST(EndToEndTest, SourceClockJumpsNeverMakeAGarbageDuration) {
