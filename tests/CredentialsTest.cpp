@@ -8,6 +8,7 @@
 
 #include <filesystem>
 #include <fstream>
+#include <map>
 #include <thread>
 
 #include "platform/framework/Credentials.h"
@@ -73,40 +74,39 @@ TEST(CredentialsTest, CredentialProcessIsBoundedAndLeavesNoProcessBehind) {
 }
 
 TEST(CredentialsTest, ControlCharactersInKeysOrTokenAreRefused) {
-    FrameworkOptions options;
-    options.region = "eu-west-1";
     const struct {
-        const char *key, *secret, *token;  // the environment; null: not set
-        std::string process;               // its AccessKeyId, JSON-escaped; "": no process
+        std::map<std::string, std::string> environment;
+        std::string process;  // its AccessKeyId, JSON-escaped; "": the environment is read
         std::string why;
     } cases[] = {
-        {"AKID\r\nX-Injected: 1", "s", "t", "", "AWS_ACCESS_KEY_ID holds a control character"},
-        {"AKID", "s\n", "t", "", "AWS_SECRET_ACCESS_KEY holds a control character"},
-        {"AKID", "s", "t\x7f", "", "AWS_SESSION_TOKEN holds a control character"},
-        {nullptr, nullptr, nullptr, "A\\r\\nX-Injected: 1",
-         "its AccessKeyId holds a control character"},
+        {{{"AWS_ACCESS_KEY_ID", "AKID\r\nX-Injected: 1"}, {"AWS_SECRET_ACCESS_KEY", "s"}},
+         "",
+         "AWS_ACCESS_KEY_ID holds a control character"},
+        {{{"AWS_ACCESS_KEY_ID", "AKID"}, {"AWS_SECRET_ACCESS_KEY", "s\n"}},
+         "",
+         "AWS_SECRET_ACCESS_KEY holds a control character"},
+        {{{"AWS_ACCESS_KEY_ID", "AKID"},
+          {"AWS_SECRET_ACCESS_KEY", "s"},
+          {"AWS_SESSION_TOKEN", "t\x7f"}},
+         "",
+         "AWS_SESSION_TOKEN holds a control character"},
+        {{}, "A\\r\\nX-Injected: 1", "its AccessKeyId holds a control character"},
     };
     for (const auto& c : cases) {
         SCOPED_TRACE(c.why);
-        const std::pair<const char*, const char*> environment[] = {
-            {"AWS_ACCESS_KEY_ID", c.key},
-            {"AWS_SECRET_ACCESS_KEY", c.secret},
-            {"AWS_SESSION_TOKEN", c.token}};
-        for (const auto& [name, value] : environment)
-            value ? setenv(name, value, 1) : unsetenv(name);
-        options.credentialProcess =
-            c.process.empty() ? ""
-                              : "printf '{\"AccessKeyId\":\"%s\",\"SecretAccessKey\":\"S\","
+        auto lookup = c.process.empty()
+                          ? credentials::FromEnvironment([&](const std::string& name) {
+                                auto it = c.environment.find(name);
+                                return it == c.environment.end() ? std::string() : it->second;
+                            })
+                          : credentials::FromCredentialProcess(
+                                "printf '{\"AccessKeyId\":\"%s\",\"SecretAccessKey\":\"S\","
                                 "\"SessionToken\":\"T\"}' '" +
-                                    c.process + "'";
-        auto result = credentials::Fetch(options);
-        EXPECT_FALSE(result.ok);
-        EXPECT_NE(result.why.find(c.why), std::string::npos) << result.why;
-        EXPECT_EQ(result.why.find("X-Injected"), std::string::npos);
+                                c.process + "'");
+        EXPECT_FALSE(lookup.Ok());
+        EXPECT_NE(lookup.why.find(c.why), std::string::npos) << lookup.why;
+        EXPECT_EQ(lookup.why.find("X-Injected"), std::string::npos);
     }
-    unsetenv("AWS_ACCESS_KEY_ID");
-    unsetenv("AWS_SECRET_ACCESS_KEY");
-    unsetenv("AWS_SESSION_TOKEN");
 }
 
 }  // namespace

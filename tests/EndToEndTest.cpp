@@ -493,9 +493,8 @@ TEST(EndToEndTest, RunsThatCannotRecordEndWithTheirStatus) {
 // without pacing it was hundreds of each per second).
 TEST(EndToEndTest, RefusedSecretMakesNoStormOfRequestsOrLogLines) {
     using testsupport::ScriptedHttpServer;
-    ScriptedHttpServer server(
-        ScriptedHttpServer::Mode::kRespond,
-        testsupport::S3ErrorAnswer("403 Forbidden", "SignatureDoesNotMatch"));
+    ScriptedHttpServer server(ScriptedHttpServer::Mode::kRespond,
+                              testsupport::S3ErrorAnswer("403 Forbidden", "SignatureDoesNotMatch"));
     const std::string dir = Scratch("storm");
     const int seconds = 12;
     auto r = RunProcess(Words("env AWS_ACCESS_KEY_ID=AKIDTEST AWS_SECRET_ACCESS_KEY=wrong "

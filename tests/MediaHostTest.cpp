@@ -10,7 +10,7 @@
 #include <mutex>
 #include <thread>
 
-#include "platform/framework/Credentials.h"
+#include "platform/framework/HostCredentials.h"
 #include "platform/framework/MediaHost.h"
 #include "platform/logger/LogCapture.h"
 #include "tests/support/ClipSamples.h"
@@ -291,7 +291,7 @@ TEST(MediaHostTest, CredentialsFromProcessEnvironmentOrNone) {
         auto props = run.Run().properties;
         ASSERT_EQ(props.size(), 1u);
         EXPECT_EQ(props[0].at("awsAccessKey"), "AKID1");
-        props.push_back(credentials::Fetch(run.process->Options()).properties);
+        props.push_back(HostCredentials(run.process->Options()).Fetch(true).properties);
         EXPECT_EQ(props[1].at("awsAccessKey"), "AKID2");  // asked again, not cached
         EXPECT_EQ(props[1].at("awsSecretKey"), "s3cr3t-value");
         EXPECT_EQ(props[1].at("sessionToken"), "tok");

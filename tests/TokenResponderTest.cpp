@@ -3,6 +3,7 @@
 // and a running answer.
 #include <gtest/gtest.h>
 #include <poll.h>
+#include <unistd.h>
 
 #include <chrono>
 #include <mutex>
@@ -30,13 +31,13 @@ TEST(TokenResponderConcurrency, AnswersArePacedByADoublingDelayThatAStoredObject
     TokenResponder* self = nullptr;
     const int kRounds = 5;
     TokenResponder responder(
-        [&](int) {
+        [&] {
             std::lock_guard<std::mutex> lock(answers.mutex);
             answers.times.push_back(Clock::now());
             // The module asks again at once, as after every refused transfer.
             if (answers.times.size() < kRounds) self->Request();
         },
-        milliseconds(40), milliseconds(160));
+        [] {}, milliseconds(40), milliseconds(160));
     self = &responder;
     const auto start = Clock::now();
     for (int i = 0; i < 10; ++i) responder.Request();  // one answer for all of them
@@ -52,20 +53,23 @@ TEST(TokenResponderConcurrency, AnswersArePacedByADoublingDelayThatAStoredObject
 
 TEST(TokenResponderConcurrency, StoredObjectEndsTheWaitAndStopEndsWaitAndAnswer) {
     Answers answers;
+    int cancel[2];
+    ASSERT_EQ(pipe(cancel), 0);
     bool cancelSeen = false;
     {
         TokenResponder responder(
-            [&](int cancelFd) {
+            [&] {
                 {
                     std::lock_guard<std::mutex> lock(answers.mutex);
                     answers.times.push_back(Clock::now());
                     if (answers.times.size() < 3) return;
                 }
                 // A long fetch: returns when the responder stops.
-                pollfd p{cancelFd, POLLIN, 0};
+                pollfd p{cancel[0], POLLIN, 0};
                 cancelSeen = poll(&p, 1, 600000) == 1;
             },
-            std::chrono::minutes(10), std::chrono::minutes(10));
+            [&] { EXPECT_EQ(write(cancel[1], "x", 1), 1); }, std::chrono::minutes(10),
+            std::chrono::minutes(10));
         responder.Request();
         ASSERT_TRUE(testsupport::WaitUntil([&] { return answers.Count() == 1; }, 30000));
         responder.Request();       // would wait 10 minutes ...
@@ -74,11 +78,13 @@ TEST(TokenResponderConcurrency, StoredObjectEndsTheWaitAndStopEndsWaitAndAnswer)
         responder.ObjectStored();
         responder.Request();
         ASSERT_TRUE(testsupport::WaitUntil([&] { return answers.Count() == 3; }, 30000));
-        responder.Stop();     // ends the running answer through its cancel descriptor
+        responder.Stop();     // ends the running answer through `cancel`
         responder.Request();  // ignored once stopped
     }
     EXPECT_TRUE(cancelSeen);
     EXPECT_EQ(answers.Count(), 3u);
+    close(cancel[0]);
+    close(cancel[1]);
 }
 
 }  // namespace

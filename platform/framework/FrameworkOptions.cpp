@@ -91,6 +91,12 @@ std::vector<OptionHelp> FrameworkOptions::Help() {
          "command that prints AWS credential_process JSON (else AWS_ACCESS_KEY_ID, "
          "AWS_SECRET_ACCESS_KEY, AWS_SESSION_TOKEN)"},
         {"keyprefix", "P", "empty", "prefix of every object key"},
+        {"sse", "AES256|aws:kms", "the bucket's", "server-side encryption"},
+        {"ssekmskeyid", "KEY", "the AWS managed key", "KMS key with -sse aws:kms"},
+        {"storageclass", "CLASS", "STANDARD", "storage class of the objects"},
+        {"acl", "ACL", "none", "canned ACL, e.g. bucket-owner-full-control"},
+        {"tagging", "K=V&...", "none", "tags of every object"},
+        {"addressing", "auto|path|virtual", "auto", "bucket addressing style"},
         {"segmentformat", "ts", "ts", "object format"},
         {"readrate", "R", "1 for files", "pace a file at R times real time; 0 reads at once"},
         {"duration", "S", "none", "end after S seconds of input"},
