@@ -2,7 +2,7 @@
 JOBS ?= $(shell nproc)
 CMAKE_GEN := -G Ninja
 
-.PHONY: deps build run test tsan bench format clean
+.PHONY: deps build run test tsan fuzz bench format clean
 
 deps:
 	@bash scripts/install-deps.sh
@@ -21,12 +21,23 @@ test: deps
 	@cmake --build build-asan -j $(JOBS)
 	@cd build-asan && ctest --output-on-failure -j $(JOBS) --timeout 600
 
-# Under ThreadSanitizer: the concurrency tests (suites whose name holds "Concurrency") and the
-# in-process pipeline (suites holding "Pipeline"), where every thread of the recorder runs.
+# Under ThreadSanitizer: the tests labelled "concurrency" in tests/CMakeLists.txt (threads
+# racing, and the in-process pipeline where every thread of the recorder runs).
 tsan: deps
 	@cmake -S . -B build-tsan $(CMAKE_GEN) -DCMAKE_BUILD_TYPE=Debug -DSFR_SANITIZE=thread >/dev/null
 	@cmake --build build-tsan -j $(JOBS)
-	@cd build-tsan && ctest --output-on-failure -j $(JOBS) --timeout 600 -R 'Concurrency|Pipeline'
+	@cd build-tsan && ctest --output-on-failure -j $(JOBS) --timeout 600 -L concurrency
+
+# The segment writer fuzz test for FUZZ_SECONDS with a random seed, which it prints; replay a
+# seed with `make fuzz SEED=<seed>`. `make test` runs it briefly with a fixed seed.
+FUZZ_SECONDS ?= 60
+SEED ?=
+fuzz: deps
+	@cmake -S . -B build-asan $(CMAKE_GEN) -DCMAKE_BUILD_TYPE=Debug -DSFR_SANITIZE=address >/dev/null
+	@cmake --build build-asan -j $(JOBS) --target SegmentWriterFuzzTest
+	@seed=$(SEED); seed=$${seed:-$$(od -An -N4 -tu4 /dev/urandom | tr -d ' ')}; \
+	  echo "fuzz seed $$seed (replay: make fuzz SEED=$$seed)"; \
+	  SFR_FUZZ_SEED=$$seed SFR_FUZZ_SECONDS=$(FUZZ_SECONDS) build-asan/tests/SegmentWriterFuzzTest
 
 bench: deps
 	@cmake -S . -B build-bench $(CMAKE_GEN) -DCMAKE_BUILD_TYPE=Release -DSFR_BENCH=ON >/dev/null

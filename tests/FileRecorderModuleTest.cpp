@@ -4,7 +4,7 @@
 #include <chrono>
 #include <thread>
 
-#include "platform/logger/LogCapture.h"
+#include "tests/support/LogCapture.h"
 #include "platform/logger/Logger.h"
 #include "platform/nal/StreamAnalyzer.h"
 #include "src/FileRecorderModule.h"
@@ -238,7 +238,7 @@ TEST(FileRecorderModuleDrain, EndOfStreamStoresTheTailToTheLastSample) {
     p.Open(log);
     auto start = std::chrono::steady_clock::now();
     EXPECT_TRUE(p.h.Process().drainProcess(30000));  // nothing held: returns at once
-    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(2));
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(10));
     EXPECT_EQ(p.transfer->RequestCount(), 0u);
 
     p.Stream(0, 5000, 1000);
