@@ -10,11 +10,11 @@
 #include <vector>
 
 #include "platform/framework/ReceivedSample.h"
-#include "platform/framework/TestHost.h"
 #include "platform/logger/Logger.h"
 #include "platform/transfer/FileTransfer.h"
 #include "src/FileRecorderModule.h"
 #include "src/ProcessControl.h"
+#include "tests/support/TestHost.h"
 
 namespace {
 

@@ -4,8 +4,8 @@
 #include <sys/stat.h>
 
 #include "platform/framework/FrameworkOptions.h"
-#include "platform/logger/LogCapture.h"
 #include "platform/transfer/FileTransfer.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/TestSupport.h"
 
 using namespace testsupport;

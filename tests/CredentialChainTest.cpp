@@ -12,8 +12,8 @@
 
 #include "platform/awsauth/CredentialChain.h"
 #include "platform/framework/HostCredentials.h"
-#include "platform/logger/LogCapture.h"
 #include "tests/support/AwsStandIns.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/ScriptedHttpServer.h"
 #include "tests/support/TestSupport.h"
 

@@ -14,9 +14,9 @@
 #include "platform/awsauth/InstanceMetadata.h"
 #include "platform/awsauth/ProfileCredentials.h"
 #include "platform/awsauth/WebIdentityCredentials.h"
-#include "platform/logger/LogCapture.h"
 #include "platform/transfer/S3Store.h"
 #include "tests/support/AwsStandIns.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/ScriptedHttpServer.h"
 #include "tests/support/TestSupport.h"
 

@@ -3,11 +3,11 @@
 #include <chrono>
 #include <thread>
 
-#include "platform/logger/LogCapture.h"
 #include "src/DataController.h"
 #include "src/DataUploader.h"
 #include "src/FileBuffer.h"
 #include "src/TimeManager.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/RecordingObserver.h"
 #include "tests/support/ScriptedTransfer.h"
 #include "tests/support/TestSupport.h"

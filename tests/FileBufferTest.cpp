@@ -8,8 +8,8 @@
 #include <thread>
 #include <vector>
 
-#include "platform/logger/LogCapture.h"
 #include "src/FileBuffer.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/TestSupport.h"
 
 namespace Orvane {

@@ -4,10 +4,10 @@
 #include <chrono>
 #include <thread>
 
-#include "tests/support/LogCapture.h"
 #include "platform/logger/Logger.h"
 #include "platform/nal/StreamAnalyzer.h"
 #include "src/FileRecorderModule.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/ProcessHarness.h"
 #include "tests/support/ScriptedTransfer.h"
 #include "tests/support/TestSupport.h"

@@ -3,8 +3,8 @@
 
 #include <thread>
 
-#include "platform/logger/LogCapture.h"
 #include "platform/logger/Logger.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/TestSupport.h"
 
 TEST(LoggerFormat, LineCarriesPriorityLocationAndTextAndCaptureSeesEveryLineWhole) {

@@ -12,8 +12,8 @@
 
 #include "platform/framework/HostCredentials.h"
 #include "platform/framework/MediaHost.h"
-#include "platform/logger/LogCapture.h"
 #include "tests/support/ClipSamples.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/TestSupport.h"
 
 extern "C" {

@@ -10,8 +10,8 @@
 
 #include "modulebase/Module.h"
 #include "platform/framework/StreamData.h"
-#include "platform/logger/LogCapture.h"
 #include "platform/logger/Logger.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/TestSupport.h"
 
 using testsupport::MakeSample;

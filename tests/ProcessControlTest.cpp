@@ -2,9 +2,9 @@
 
 #include <algorithm>
 
-#include "platform/logger/LogCapture.h"
 #include "src/FileRecorderModule.h"
 #include "src/ProcessControl.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/ProcessHarness.h"
 #include "tests/support/TestSupport.h"
 

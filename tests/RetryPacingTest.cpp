@@ -7,11 +7,11 @@
 #include <functional>
 #include <thread>
 
-#include "platform/logger/LogCapture.h"
 #include "platform/transfer/LocalDirectoryStore.h"
 #include "platform/transfer/RetryPacing.h"
 #include "platform/transfer/S3Store.h"
 #include "platform/transfer/SegmentTransfer.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/S3rver.h"
 #include "tests/support/ScriptedHttpServer.h"
 #include "tests/support/StoreRoot.h"

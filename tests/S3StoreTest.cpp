@@ -8,11 +8,11 @@
 #include <thread>
 #include <vector>
 
-#include "platform/logger/LogCapture.h"
 #include "platform/transfer/Digest.h"
 #include "platform/transfer/S3Response.h"
 #include "platform/transfer/S3Store.h"
 #include "platform/transfer/S3Target.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/S3rver.h"
 #include "tests/support/ScriptedHttpServer.h"
 #include "tests/support/TestSupport.h"

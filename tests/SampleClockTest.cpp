@@ -3,7 +3,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/framework/SampleClock.h"
-#include "platform/logger/LogCapture.h"
+#include "tests/support/LogCapture.h"
 
 namespace {
 

@@ -7,11 +7,11 @@
 #include <fstream>
 #include <sstream>
 
-#include "platform/logger/LogCapture.h"
 #include "platform/transfer/LocalDirectoryStore.h"
 #include "platform/transfer/ObjectKey.h"
 #include "platform/transfer/SegmentTransfer.h"
 #include "tests/support/ClipSamples.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/StoreRoot.h"
 #include "tests/support/TestSupport.h"
 

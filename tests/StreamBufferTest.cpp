@@ -13,9 +13,9 @@
 #include <thread>
 #include <vector>
 
-#include "platform/logger/LogCapture.h"
 #include "src/NalAnalyzer.h"
 #include "src/StreamBuffer.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/RecordingObserver.h"
 #include "tests/support/TestSupport.h"
 

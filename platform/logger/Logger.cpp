@@ -4,24 +4,30 @@
 #include <spdlog/sinks/stdout_sinks.h>
 #include <spdlog/spdlog.h>
 
+#include <algorithm>
 #include <atomic>
 #include <cstdarg>
 #include <cstdio>
 #include <memory>
 #include <mutex>
+#include <utility>
 #include <vector>
-
-#include "platform/logger/LogCapture.h"
 
 namespace {
 
+// Where lines go. Never changed once published: a change publishes a new one, so Put reads
+// a consistent set with one atomic load and holds it (and its sinks) while it writes.
+struct Destinations {
+    std::shared_ptr<spdlog::logger> main;                         // stderr or the log file
+    std::vector<std::pair<std::shared_ptr<LogSink>, int>> sinks;  // with the level of each
+};
+
+// The highest priority number any destination takes; Put drops the rest before formatting.
 std::atomic<int> g_level{Logger::kDefaultLevel};
-// Level asked for by the user; g_level is raised above it while captures exist.
+// The level of `main` (SetLevel).
 std::atomic<int> g_userLevel{Logger::kDefaultLevel};
 
-std::mutex g_sinkMutex;  // guards g_captures and the logger swap
-std::vector<LogCapture*> g_captures;
-std::atomic<int> g_captureCount{0};  // g_captures.size(), readable without the lock
+std::mutex g_changeMutex;  // serialises changes of the destinations and the levels
 
 std::shared_ptr<spdlog::logger> makeLogger(spdlog::sink_ptr sink) {
     auto logger = std::make_shared<spdlog::logger>("recorder", std::move(sink));
@@ -32,18 +38,27 @@ std::shared_ptr<spdlog::logger> makeLogger(spdlog::sink_ptr sink) {
     return logger;
 }
 
-std::shared_ptr<spdlog::logger>& currentLogger() {
-    static std::shared_ptr<spdlog::logger> logger =
-        makeLogger(std::make_shared<spdlog::sinks::stderr_sink_mt>());
-    return logger;
+// Read with std::atomic_load; replaced with std::atomic_store under g_changeMutex.
+std::shared_ptr<const Destinations>& destinations() {
+    static std::shared_ptr<const Destinations> current = std::make_shared<const Destinations>(
+        Destinations{makeLogger(std::make_shared<spdlog::sinks::stderr_sink_mt>()), {}});
+    return current;
+}
+
+// Caller holds g_changeMutex.
+void publish(Destinations next) {
+    int level = g_userLevel.load();
+    for (const auto& sink : next.sinks) level = std::max(level, sink.second);
+    std::atomic_store(&destinations(), std::make_shared<const Destinations>(std::move(next)));
+    g_level = level;
 }
 
 }  // namespace
 
 void Logger::SetLevel(int level) {
-    std::lock_guard<std::mutex> lock(g_sinkMutex);
+    std::lock_guard<std::mutex> lock(g_changeMutex);
     g_userLevel = level;
-    g_level = g_captures.empty() ? level : 1000;
+    publish(*std::atomic_load(&destinations()));
 }
 
 int Logger::GetLevel() {
@@ -57,12 +72,30 @@ bool Logger::Enabled(int priority) {
 bool Logger::SetFile(const std::string& path) {
     try {
         auto sink = std::make_shared<spdlog::sinks::basic_file_sink_mt>(path, false);
-        std::lock_guard<std::mutex> lock(g_sinkMutex);
-        std::atomic_store(&currentLogger(), makeLogger(sink));
+        std::lock_guard<std::mutex> lock(g_changeMutex);
+        Destinations next = *std::atomic_load(&destinations());
+        next.main = makeLogger(sink);
+        publish(std::move(next));
         return true;
     } catch (const spdlog::spdlog_ex&) {
         return false;
     }
+}
+
+void Logger::AddSink(std::shared_ptr<LogSink> sink, int level) {
+    std::lock_guard<std::mutex> lock(g_changeMutex);
+    Destinations next = *std::atomic_load(&destinations());
+    next.sinks.emplace_back(std::move(sink), level);
+    publish(std::move(next));
+}
+
+void Logger::RemoveSink(const LogSink* sink) {
+    std::lock_guard<std::mutex> lock(g_changeMutex);
+    Destinations next = *std::atomic_load(&destinations());
+    next.sinks.erase(std::remove_if(next.sinks.begin(), next.sinks.end(),
+                                    [sink](const auto& s) { return s.first.get() == sink; }),
+                     next.sinks.end());
+    publish(std::move(next));
 }
 
 void Logger::Put(int priority, const char* file, const char* function, int line, const char* format,
@@ -88,8 +121,9 @@ void Logger::Put(int priority, const char* file, const char* function, int line,
     }
     va_end(copy);
 
+    const auto current = std::atomic_load(&destinations());
     if (priority <= g_userLevel.load(std::memory_order_relaxed)) {
-        auto logger = std::atomic_load(&currentLogger());
+        const auto& logger = current->main;
         if (file != nullptr && function != nullptr) {
             logger->info("<{}> {}:{} {}: {}", priority, file, line, function, text);
         } else if (function != nullptr) {
@@ -98,31 +132,6 @@ void Logger::Put(int priority, const char* file, const char* function, int line,
             logger->info("<{}> {}", priority, text);
         }
     }
-
-    if (g_captureCount.load(std::memory_order_acquire) == 0) return;
-    std::lock_guard<std::mutex> lock(g_sinkMutex);
-    {
-        LogRecord record{priority, file ? file : "", function ? function : "", line, text};
-        for (LogCapture* capture : g_captures) capture->Add(record);
-    }
-}
-
-// Registration of captures lives here so that it shares g_sinkMutex with Put.
-void registerCapture(LogCapture* capture) {
-    std::lock_guard<std::mutex> lock(g_sinkMutex);
-    g_captures.push_back(capture);
-    g_captureCount = static_cast<int>(g_captures.size());
-    g_level = 1000;
-}
-
-void unregisterCapture(LogCapture* capture) {
-    std::lock_guard<std::mutex> lock(g_sinkMutex);
-    for (auto it = g_captures.begin(); it != g_captures.end(); ++it) {
-        if (*it == capture) {
-            g_captures.erase(it);
-            break;
-        }
-    }
-    g_captureCount = static_cast<int>(g_captures.size());
-    if (g_captures.empty()) g_level = g_userLevel.load();
+    for (const auto& [sink, level] : current->sinks)
+        if (priority <= level) sink->Write(LogLine{priority, file, function, line, text});
 }

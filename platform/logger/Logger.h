@@ -5,10 +5,14 @@
 //   enter.
 // File, function and line are left out when null/0. Lines whose priority number is above the
 // level are dropped before any formatting, so trace lines cost one atomic load when off.
+// Further destinations (LogSink) may be added; each has a level of its own.
 // Thread-safe: any thread may call any member at any time.
 #pragma once
 
+#include <memory>
 #include <string>
+
+#include "platform/logger/LogSink.h"
 
 class Logger {
   public:
@@ -21,10 +25,16 @@ class Logger {
     // Lines with a priority number above `level` are dropped.
     static void SetLevel(int level);
     static int GetLevel();
-    // True when a line of this priority would be written (or captured).
+    // True when a line of this priority would be written somewhere (destination or sink).
     static bool Enabled(int priority);
 
     // Sends the lines to `path` (appended) instead of stderr. False if it cannot be opened;
     // the previous destination then stays.
     static bool SetFile(const std::string& path);
+
+    // Also hands every line with a priority number up to `level` to `sink`, whatever the level
+    // of the destination (SetLevel). The sink is held until RemoveSink.
+    static void AddSink(std::shared_ptr<LogSink> sink, int level);
+    // Ends what AddSink began; lines of Put calls under way may still reach the sink.
+    static void RemoveSink(const LogSink* sink);
 };

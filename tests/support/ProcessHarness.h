@@ -5,8 +5,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/framework/TestHost.h"
 #include "src/ProcessControl.h"
+#include "tests/support/TestHost.h"
 
 namespace testsupport {
 

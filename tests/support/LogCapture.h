@@ -1,12 +1,11 @@
-// LogCapture: a test sink that records every line Logger::Put writes while it lives.
+// LogCapture: records every line Logger::Put writes while it lives, whatever the log level.
 //
-// While at least one capture exists the level is raised to capture every priority and lines
-// still go to the normal destination only if their priority is within the level set before.
+// Lines still go to the log destination only when their priority is within its level.
 // Thread-safe; records keep the order in which Put calls finished formatting.
 #pragma once
 
 #include <cstddef>
-#include <functional>
+#include <memory>
 #include <mutex>
 #include <string>
 #include <vector>
@@ -35,10 +34,7 @@ class LogCapture {
     std::vector<std::string> Messages() const;
     void Clear();
 
-    // Internal: called by Logger for every line.
-    void Add(const LogRecord& record);
-
   private:
-    mutable std::mutex mutex_;
-    std::vector<LogRecord> records_;
+    struct Sink;                  // what Logger writes to
+    std::shared_ptr<Sink> sink_;  // shared with Logger until the destructor
 };

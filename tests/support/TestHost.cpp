@@ -1,4 +1,4 @@
-#include "platform/framework/TestHost.h"
+#include "tests/support/TestHost.h"
 
 #include <chrono>
 
