@@ -11,7 +11,7 @@
 set -euo pipefail
 cd "$(dirname "$0")/.."
 build=${1:-build-bench}
-recorder=$build/src/stream-file-recorder
+recorder=$build/stream-file-recorder
 runs=${RUNS:-5}
 media=$build/bench-media
 clip=$media/in.ts

@@ -11,7 +11,6 @@ cd "$(dirname "$0")/.."
 build=${1:-build}
 seconds=${2:-30}
 recorder=$build/stream-file-recorder
-[ -x "$recorder" ] || recorder=$build/src/stream-file-recorder
 work=$(mktemp -d)
 pids=()
 cleanup() {

@@ -8,7 +8,7 @@
 # recorder's.
 set -euo pipefail
 cd "$(dirname "$0")/.."
-recorder=build/src/stream-file-recorder
+recorder=build/stream-file-recorder
 clip=build/demo/demo.mp4
 
 if [ ! -s "$clip" ]; then

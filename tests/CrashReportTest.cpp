@@ -325,7 +325,7 @@ bool CatchesSegv(pid_t pid, const std::string& program) {
 }
 
 TEST(CrashReportRecorder, KillSegvLeavesAReportBesideTheExecutable) {
-    ProgramCopy recorder("src/stream-file-recorder");
+    ProgramCopy recorder("stream-file-recorder");
     // The status output is a FIFO nobody reads: opening it blocks, so the recorder stays in
     // Initialize until it is killed. AddressSanitizer's own SIGSEGV handler is off so that the
     // reporter's handler is the only one and the signal goes on to the default action.

@@ -55,7 +55,7 @@ std::string Store(const std::string& dir) {
 }
 
 Args RecorderArgs(const std::string& input, const std::string& dir, const Args& extra) {
-    return Args{BuildPath("src/stream-file-recorder"), "-input", input} +
+    return Args{BuildPath("stream-file-recorder"), "-input", input} +
            Words(
                "-uploadinterval 1 -bufferfullsize 100 -authretrytime 3000 -kct h264 "
                "-bucketname rec") +

@@ -29,7 +29,7 @@ std::vector<std::string> with(const std::string& option, const std::string& valu
 
 // Runs the real binary with `args`.
 testsupport::ProcessResult runRecorder(std::vector<std::string> args) {
-    args.insert(args.begin(), testsupport::BuildPath("src/stream-file-recorder"));
+    args.insert(args.begin(), testsupport::BuildPath("stream-file-recorder"));
     return testsupport::RunProcess(args);
 }
 
