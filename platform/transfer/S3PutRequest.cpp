@@ -34,12 +34,14 @@ void AddMetadata(const ObjectToStore& object, SigV4Request& request) {
 
 }  // namespace
 
-S3Payload DigestS3Payload(const ObjectToStore& object) {
+S3Payload DigestS3Payload(const ObjectToStore& object, const S3Target& target) {
     S3Payload payload;
     const digest::Md5 md5 = digest::Md5Of(object.data, object.size);
     payload.md5Base64 = digest::Base64(md5);
     payload.md5Hex = digest::Hex(md5);
-    payload.sha256Hex = digest::Hex(digest::Sha256Of(object.data, object.size));
+    const bool overTls = target.url.compare(0, 8, "https://") == 0;
+    payload.sha256Hex =
+        overTls ? "UNSIGNED-PAYLOAD" : digest::Hex(digest::Sha256Of(object.data, object.size));
     return payload;
 }
 

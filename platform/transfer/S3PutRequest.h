@@ -6,10 +6,10 @@
 // carries a line break or another control character (such a value would add a header of its
 // own), so any server signs exactly what it received.
 //
-// Headers: host, Content-MD5, Content-Type, x-amz-content-sha256 (the body's SHA-256),
-// x-amz-date, x-amz-security-token when there is a session token, the object's metadata as
-// x-amz-meta-* (names folded to HTTP tokens; of two names that fold into one, the first wins),
-// and the store's headers of every object (encryption, storage class, ACL, tags).
+// Headers: host, Content-MD5, Content-Type, x-amz-content-sha256 (see S3Payload), x-amz-date,
+// x-amz-security-token when there is a session token, the object's metadata as x-amz-meta-*
+// (names folded to HTTP tokens; of two names that fold into one, the first wins), and the
+// store's headers of every object (encryption, storage class, ACL, tags).
 #pragma once
 
 #include <string>
@@ -19,14 +19,16 @@
 #include "platform/transfer/ObjectStore.h"
 #include "platform/transfer/S3Target.h"
 
-// The body's digests, as the request carries them.
+// The body's digests, as the request carries them. Over HTTPS the signature does not cover the
+// body (x-amz-content-sha256: UNSIGNED-PAYLOAD): TLS guards it on the way and Content-MD5 lets
+// S3 check it, so the body is hashed once. Over plain HTTP the signature covers its SHA-256 too.
 struct S3Payload {
     std::string md5Base64;  // Content-MD5
     std::string md5Hex;     // to compare with the ETag of the answer
-    std::string sha256Hex;  // x-amz-content-sha256: the body's SHA-256 in lower-case hex
+    std::string sha256Hex;  // x-amz-content-sha256: lower-case hex SHA-256, or UNSIGNED-PAYLOAD
 };
 
-S3Payload DigestS3Payload(const ObjectToStore& object);
+S3Payload DigestS3Payload(const ObjectToStore& object, const S3Target& target);
 
 struct S3PutRequest {
     // Every signed header, names in lower case, values as sent.

@@ -328,7 +328,7 @@ FileTransferResult S3Store::Put(const ObjectToStore& object, const StoreCredenti
     S3Target target;
     const FileTransferResult refusal = checkSendable(object, credentials, target);
     if (refusal != Success) return refusal;
-    const S3Payload payload = DigestS3Payload(object);
+    const S3Payload payload = DigestS3Payload(object, target);
     const auto started = std::chrono::steady_clock::now();
     const FileTransferResult result = RunAttempts(
         config_.retry, cancel_, [&] { return attempt(target, object, credentials, payload); });

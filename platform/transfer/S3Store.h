@@ -5,12 +5,12 @@
 // connection failure, a timeout) is tried again as config.retry says (RetryPacing); the
 // credentials, region, bucket and key are checked before anything is sent, so a value with a line
 // break never reaches the wire, and the key travels exactly as signed ("." and ".." parts
-// included). The request carries the body's real SHA-256 (x-amz-content-sha256), its MD5
-// (Content-MD5, so S3 rejects a body damaged on the way), the session token when there is one,
-// and the object's metadata as x-amz-meta-* headers; it is signed with SigV4Signer. The answer
-// is read whole: the XML error Code decides the result, and on success the ETag must be the
-// body's MD5. After RequestTimeTooSkewed the signing clock is set to the server's time, so the
-// caller's retry can succeed.
+// included). The request carries the body's MD5 (Content-MD5, so S3 rejects a body damaged on
+// the way), over plain HTTP also its SHA-256 under the signature (S3Payload), the session token
+// when there is one, and the object's metadata as x-amz-meta-* headers; it is signed with
+// SigV4Signer. The answer is read whole: the XML error Code decides the result, and on success the
+// ETag must be the body's MD5. After RequestTimeTooSkewed the signing clock is set to the server's
+// time, so the caller's retry can succeed.
 //
 // Cancel may come from any thread at any time (also before or between Puts). It ends a running
 // Put within 100 ms (curl_multi_wakeup interrupts the wait in curl_multi_poll; the wait before a

@@ -196,7 +196,11 @@ class ObjectMuxer {
         context->avoid_negative_ts = AVFMT_AVOID_NEG_TS_DISABLED;
         context->flags &= ~AVFMT_FLAG_AUTO_BSF;
         // Container overhead (TS: headers, PES, PAT/PMT) stays well under 10 % of the payload.
-        out_->reserve(payloadBytes + payloadBytes / 10 + 4096);
+        // The caller's buffer serves every object of the run: when it must grow, it grows with
+        // room for larger objects to come, so that it is rarely allocated (and first touched)
+        // again.
+        const size_t needed = payloadBytes + payloadBytes / 10 + 4096;
+        if (out_->capacity() < needed) out_->reserve(needed + needed / 4);
         return true;
     }
 
