@@ -1,4 +1,5 @@
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <thread>
@@ -32,6 +33,38 @@ TEST(LoggerFormat, LineCarriesPriorityLocationAndTextAndCaptureSeesEveryLineWhol
     EXPECT_EQ(records[0].file, "src/StreamBuffer");
     EXPECT_EQ(records[0].message, "Start enter.");
     EXPECT_EQ(records[3].message, longText);
+}
+
+// What a log file never holds: a line split by a value's control characters, a storm of one
+// repeated warning, or anything written through a planted link.
+TEST(LoggerFormat, ControlCharactersEscapedRepeatedWarningsCondensedLinksNotFollowed) {
+    char dir[] = "/tmp/sfr-logdir-XXXXXX";
+    ASSERT_NE(mkdtemp(dir), nullptr);
+    const std::string path = std::string(dir) + "/log.txt";
+    ASSERT_TRUE(Logger::SetFile(path));
+    Logger::Put(11, nullptr, nullptr, 0, "stream id %s", "cam\r\n2026-01-01 <4> forged");
+    for (int i = 0; i < 1000; ++i) Logger::Put(5, "f", "g", 7, "store refused: %s", "NoSuchBucket");
+    std::string text = testsupport::ReadFile(path);
+    EXPECT_NE(text.find("stream id cam\\x0d\\x0a2026-01-01 <4> forged\n"), std::string::npos);
+    size_t refusals = 0;
+    for (size_t at = 0; (at = text.find("store refused", at)) != std::string::npos; ++at)
+        ++refusals;
+    EXPECT_EQ(refusals, 1u) << text.substr(0, 2000);
+    struct stat st {};
+    ASSERT_EQ(stat(path.c_str(), &st), 0);
+    EXPECT_EQ(
+        st.st_mode & 0777, 0640u & ~[] {
+            mode_t mask = umask(0);
+            umask(mask);
+            return mask;
+        }());
+
+    const std::string link = std::string(dir) + "/link.txt";
+    ASSERT_EQ(symlink(path.c_str(), link.c_str()), 0);
+    EXPECT_FALSE(Logger::SetFile(link));
+    unlink(link.c_str());
+    unlink(path.c_str());
+    rmdir(dir);
 }
 
 TEST(LoggerConcurrency, ConcurrentWritersLoseNoLine) {

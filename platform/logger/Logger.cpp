@@ -1,8 +1,10 @@
 #include "platform/logger/Logger.h"
 
-#include <spdlog/sinks/basic_file_sink.h>
+#include <fcntl.h>
+#include <spdlog/sinks/base_sink.h>
 #include <spdlog/sinks/stdout_sinks.h>
 #include <spdlog/spdlog.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <atomic>
@@ -12,6 +14,8 @@
 #include <mutex>
 #include <utility>
 #include <vector>
+
+#include "platform/logger/LineCondenser.h"
 
 namespace {
 
@@ -28,6 +32,66 @@ std::atomic<int> g_level{Logger::kDefaultLevel};
 std::atomic<int> g_userLevel{Logger::kDefaultLevel};
 
 std::mutex g_changeMutex;  // serialises changes of the destinations and the levels
+
+// A log file written through a descriptor of our own, so that it is opened without following a
+// symbolic link at its last component and created with mode 0640 (spdlog's file sink opens by
+// name, through links).
+class DescriptorSink : public spdlog::sinks::base_sink<std::mutex> {
+  public:
+    explicit DescriptorSink(int fd) : fd_(fd) {}
+    ~DescriptorSink() override { close(fd_); }
+
+  protected:
+    void sink_it_(const spdlog::details::log_msg& message) override {
+        spdlog::memory_buf_t formatted;
+        formatter_->format(message, formatted);
+        const char* data = formatted.data();
+        size_t left = formatted.size();
+        while (left > 0) {
+            ssize_t n = write(fd_, data, left);
+            if (n < 0 && errno == EINTR) continue;
+            if (n <= 0) return;  // a full disk loses lines, never the process
+            data += n;
+            left -= static_cast<size_t>(n);
+        }
+    }
+    void flush_() override {}
+
+  private:
+    const int fd_;
+};
+
+// Failure and warning lines (priority 5 or less) that repeat are condensed.
+constexpr int kCondensedPriority = 5;
+LineCondenser& condenser() {
+    static LineCondenser instance;
+    return instance;
+}
+
+// `text` with every control character as \xNN, so that a value in a line (a stream id, a key,
+// an answer's text) can never start a line of its own; false (and `escaped` untouched) when
+// it holds none. A line break that ends the text is left as it is: some of the recorder's own
+// texts end with one.
+bool escapeControls(const char* text, std::string* escaped) {
+    auto isControl = [](const char* p) {
+        const auto c = static_cast<unsigned char>(*p);
+        return (c < 0x20 || c == 0x7f) && !(c == '\n' && p[1] == '\0');
+    };
+    const char* p = text;
+    while (*p != '\0' && !isControl(p)) ++p;
+    if (*p == '\0') return false;
+    escaped->assign(text, p);
+    for (; *p != '\0'; ++p) {
+        if (!isControl(p)) {
+            escaped->push_back(*p);
+            continue;
+        }
+        char hex[8];
+        std::snprintf(hex, sizeof hex, "\\x%02x", static_cast<unsigned char>(*p));
+        escaped->append(hex);
+    }
+    return true;
+}
 
 std::shared_ptr<spdlog::logger> makeLogger(spdlog::sink_ptr sink) {
     auto logger = std::make_shared<spdlog::logger>("recorder", std::move(sink));
@@ -70,16 +134,14 @@ bool Logger::Enabled(int priority) {
 }
 
 bool Logger::SetFile(const std::string& path) {
-    try {
-        auto sink = std::make_shared<spdlog::sinks::basic_file_sink_mt>(path, false);
-        std::lock_guard<std::mutex> lock(g_changeMutex);
-        Destinations next = *std::atomic_load(&destinations());
-        next.main = makeLogger(sink);
-        publish(std::move(next));
-        return true;
-    } catch (const spdlog::spdlog_ex&) {
-        return false;
-    }
+    const int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NOFOLLOW, 0640);
+    if (fd < 0) return false;
+    auto sink = std::make_shared<DescriptorSink>(fd);
+    std::lock_guard<std::mutex> lock(g_changeMutex);
+    Destinations next = *std::atomic_load(&destinations());
+    next.main = makeLogger(sink);
+    publish(std::move(next));
+    return true;
 }
 
 void Logger::AddSink(std::shared_ptr<LogSink> sink, int level) {
@@ -120,16 +182,29 @@ void Logger::Put(int priority, const char* file, const char* function, int line,
         stackBuffer[0] = '\0';
     }
     va_end(copy);
+    std::string escaped;
+    if (escapeControls(text, &escaped)) text = escaped.c_str();
 
     const auto current = std::atomic_load(&destinations());
-    if (priority <= g_userLevel.load(std::memory_order_relaxed)) {
+    uint64_t repeats = 0;
+    if (priority <= g_userLevel.load(std::memory_order_relaxed) &&
+        (priority > kCondensedPriority ||
+         condenser().Offer(std::string(file ? file : "") + ":" + std::to_string(line) + " " + text,
+                           LineCondenser::Clock::now(), &repeats))) {
+        std::string counted;
+        if (repeats > 0) {
+            counted = std::string(text) + " (and " + std::to_string(repeats) +
+                      " more like it in the last " +
+                      std::to_string(LineCondenser::kWindow.count()) + " s)";
+        }
+        const char* written = repeats > 0 ? counted.c_str() : text;
         const auto& logger = current->main;
         if (file != nullptr && function != nullptr) {
-            logger->info("<{}> {}:{} {}: {}", priority, file, line, function, text);
+            logger->info("<{}> {}:{} {}: {}", priority, file, line, function, written);
         } else if (function != nullptr) {
-            logger->info("<{}> {}: {}", priority, function, text);
+            logger->info("<{}> {}: {}", priority, function, written);
         } else {
-            logger->info("<{}> {}", priority, text);
+            logger->info("<{}> {}", priority, written);
         }
     }
     for (const auto& [sink, level] : current->sinks)
