@@ -108,7 +108,7 @@ std::vector<OptionHelp> FrameworkOptions::Help() {
     };
 }
 
-const FrameworkOptions& CurrentFrameworkOptions() {
+FrameworkOptions CurrentFrameworkOptions() {
     std::lock_guard<std::mutex> lock(g_optionsMutex);
     return g_options;
 }

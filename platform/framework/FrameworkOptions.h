@@ -39,6 +39,7 @@ struct FrameworkOptions {
 };
 
 // The options of the running process, set once by BaseProcess's constructor; the transfer
-// library and the hosts read them. Empty defaults before any BaseProcess exists.
-const FrameworkOptions& CurrentFrameworkOptions();
+// library and the hosts read them. Empty defaults before any BaseProcess exists. A copy, taken
+// under the lock, so that a later Set never changes what a reader holds.
+FrameworkOptions CurrentFrameworkOptions();
 void SetCurrentFrameworkOptions(const FrameworkOptions& options);

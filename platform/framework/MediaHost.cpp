@@ -10,6 +10,7 @@ extern "C" {
 #include <utility>
 #include <vector>
 
+#include "platform/framework/FfmpegLog.h"
 #include "platform/framework/HostCredentials.h"
 #include "platform/framework/Pacer.h"
 #include "platform/framework/SignalHandling.h"
@@ -37,7 +38,9 @@ MediaHost::MediaHost(FrameworkOptions options, bool handleSignals)
           [this] {
               if (process_) deliverCredentials(*process_, "on a token request", true);
           },
-          [] { credentials::StopCommands(); }) {}
+          [] { credentials::StopCommands(); }) {
+    RouteFfmpegLogToLogger();
+}
 
 MediaHost::~MediaHost() {
     Stop();

@@ -16,6 +16,7 @@
 #include <vector>
 
 #include "platform/logger/LineCondenser.h"
+#include "platform/logger/SecretMask.h"
 
 namespace {
 
@@ -184,6 +185,8 @@ void Logger::Put(int priority, const char* file, const char* function, int line,
     va_end(copy);
     std::string escaped;
     if (escapeControls(text, &escaped)) text = escaped.c_str();
+    std::string masked;
+    if (MaskSecrets(text, &masked)) text = masked.c_str();
 
     const auto current = std::atomic_load(&destinations());
     uint64_t repeats = 0;

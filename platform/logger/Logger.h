@@ -5,6 +5,8 @@
 //   enter.
 // File, function and line are left out when null/0. Lines whose priority number is above the
 // level are dropped before any formatting, so trace lines cost one atomic load when off.
+// Every written text has its control characters as \xNN and its URL secrets masked
+// (SecretMask.h); a failure or warning line that repeats is condensed (LineCondenser.h).
 // Further destinations (LogSink) may be added; each has a level of its own.
 // Thread-safe: any thread may call any member at any time.
 #pragma once

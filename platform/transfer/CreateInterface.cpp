@@ -82,7 +82,7 @@ std::shared_ptr<IObjectStore> createS3Store(const FrameworkOptions& options) {
 }  // namespace
 
 std::shared_ptr<IFileTransfer> VqStreamFileTransfer::CreateInterface() {
-    const FrameworkOptions& options = CurrentFrameworkOptions();
+    const FrameworkOptions options = CurrentFrameworkOptions();
     const SegmentFormat* format = SegmentFormat::Find(options.segmentFormat);
     if (!format) {
         Logger::Put(4, kFile, kFunction, __LINE__,
