@@ -2,7 +2,7 @@
 JOBS ?= $(shell nproc)
 CMAKE_GEN := -G Ninja
 
-.PHONY: deps build run test tsan fuzz bench format clean
+.PHONY: deps build run test tsan fuzz bench format lint clean
 
 deps:
 	@bash scripts/install-deps.sh
@@ -48,5 +48,12 @@ bench: deps
 format:
 	@git ls-files '*.cpp' '*.h' | xargs clang-format -i
 
+# The format check and clang-tidy (.clang-tidy) over the product's sources; any finding fails.
+lint: deps
+	@git ls-files '*.cpp' '*.h' | xargs clang-format --dry-run --Werror
+	@cmake -S . -B build-lint $(CMAKE_GEN) -DCMAKE_EXPORT_COMPILE_COMMANDS=ON >/dev/null
+	@git ls-files 'src/*.cpp' 'modulebase/*.cpp' 'platform/*.cpp' 'crashreport/*.cpp' | \
+	  xargs -P $(JOBS) -n 4 clang-tidy -p build-lint --quiet 2>/dev/null
+
 clean:
-	@rm -rf build build-asan build-tsan build-bench
+	@rm -rf build build-asan build-tsan build-bench build-lint

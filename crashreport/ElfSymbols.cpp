@@ -49,7 +49,35 @@ bool inside(uint64_t offset, uint64_t length) {
     return offset <= cached.size && length <= cached.size - offset;
 }
 
-// Looks in the symbol table section `table` (of type `type`).
+// Looks for the function covering `address` among the symbols of one table, whose names are in
+// `strings`; both already checked to lie inside the file.
+bool searchSymbols(const ElfW(Shdr) & table, const ElfW(Shdr) & strings, uint64_t address,
+                   char* name, size_t size, uint64_t* displacement) {
+    const auto* symbols = reinterpret_cast<const ElfW(Sym)*>(cached.data + table.sh_offset);
+    const size_t symbolCount = table.sh_size / sizeof(ElfW(Sym));
+    for (size_t k = 0; k < symbolCount; ++k) {
+        const ElfW(Sym)& symbol = symbols[k];
+        const unsigned kind = ELF64_ST_TYPE(symbol.st_info);
+        if (kind != STT_FUNC && kind != STT_GNU_IFUNC) continue;
+        if (symbol.st_shndx == SHN_UNDEF || symbol.st_name >= strings.sh_size) continue;
+        const bool covers = symbol.st_size == 0 ? address == symbol.st_value
+                                                : address >= symbol.st_value &&
+                                                      address - symbol.st_value < symbol.st_size;
+        if (!covers) continue;
+        const char* text =
+            reinterpret_cast<const char*>(cached.data + strings.sh_offset + symbol.st_name);
+        const size_t room = strings.sh_size - symbol.st_name;  // the name ends inside the table
+        size_t length = 0;
+        while (length < room && text[length] != '\0') ++length;
+        if (length == room) continue;
+        CopyText(name, size, text);
+        *displacement = address - symbol.st_value;
+        return true;
+    }
+    return false;
+}
+
+// Looks in every symbol table section of type `type`.
 bool searchTable(const ElfW(Shdr) * sections, unsigned count, unsigned type, uint64_t address,
                  char* name, size_t size, uint64_t* displacement) {
     for (unsigned i = 0; i < count; ++i) {
@@ -58,27 +86,7 @@ bool searchTable(const ElfW(Shdr) * sections, unsigned count, unsigned type, uin
         if (table.sh_link >= count || !inside(table.sh_offset, table.sh_size)) continue;
         const ElfW(Shdr)& strings = sections[table.sh_link];
         if (!inside(strings.sh_offset, strings.sh_size)) continue;
-        const auto* symbols = reinterpret_cast<const ElfW(Sym)*>(cached.data + table.sh_offset);
-        size_t symbolCount = table.sh_size / sizeof(ElfW(Sym));
-        for (size_t k = 0; k < symbolCount; ++k) {
-            const ElfW(Sym)& symbol = symbols[k];
-            unsigned kind = ELF64_ST_TYPE(symbol.st_info);
-            if (kind != STT_FUNC && kind != STT_GNU_IFUNC) continue;
-            if (symbol.st_shndx == SHN_UNDEF || symbol.st_name >= strings.sh_size) continue;
-            bool covers = symbol.st_size == 0 ? address == symbol.st_value
-                                              : address >= symbol.st_value &&
-                                                    address - symbol.st_value < symbol.st_size;
-            if (!covers) continue;
-            const char* text =
-                reinterpret_cast<const char*>(cached.data + strings.sh_offset + symbol.st_name);
-            size_t room = strings.sh_size - symbol.st_name;  // the name ends inside the table
-            size_t length = 0;
-            while (length < room && text[length] != '\0') ++length;
-            if (length == room) continue;
-            CopyText(name, size, text);
-            *displacement = address - symbol.st_value;
-            return true;
-        }
+        if (searchSymbols(table, strings, address, name, size, displacement)) return true;
     }
     return false;
 }

@@ -2,7 +2,7 @@
 # Installs every Debian package the project needs. Idempotent: quiet and quick when all is there.
 set -euo pipefail
 packages=(
-  g++ cmake ninja-build make pkg-config clang-format
+  g++ cmake ninja-build make pkg-config clang-format clang-tidy
   libboost-thread-dev libboost-chrono-dev
   libavformat-dev libavcodec-dev libavutil-dev
   libcurl4-openssl-dev libssl-dev

@@ -16,7 +16,9 @@ TEST(FrameworkOptionsTest, InputFromTheEnvironmentOrTheCommandLine) {
         const char* streamingId;
     } cases[] = {
         {"rtsp://u:p@cam/live?token=abc", {}, "rtsp://u:p@cam/live?token=abc", "live"},
-        {"rtsp://cam/env", {"-input", "/clips/front door.mp4"}, "/clips/front door.mp4",
+        {"rtsp://cam/env",
+         {"-input", "/clips/front door.mp4"},
+         "/clips/front door.mp4",
          "front_door"},
         {nullptr, {"-input", "srt://h:9000?passphrase=x"}, "srt://h:9000?passphrase=x", "h_9000"},
         {"", {}, "", ""},

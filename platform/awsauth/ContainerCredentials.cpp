@@ -50,7 +50,7 @@ std::string ContainerCredentials::Url(std::string& why) const {
     if (!relative.empty()) {
         return std::string(kEcsHost) + (relative[0] == '/' ? "" : "/") + relative;
     }
-    const std::string full = environment_("AWS_CONTAINER_CREDENTIALS_FULL_URI");
+    std::string full = environment_("AWS_CONTAINER_CREDENTIALS_FULL_URI");
     std::string scheme = full.substr(0, full.find("://"));
     std::transform(scheme.begin(), scheme.end(), scheme.begin(),
                    [](unsigned char c) { return static_cast<char>(std::tolower(c)); });

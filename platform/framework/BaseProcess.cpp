@@ -96,6 +96,7 @@ void BaseProcess::Uninitialize() {
     host_.reset();
 }
 
+// NOLINTNEXTLINE(performance-unnecessary-value-param): the module API's signature
 bool BaseProcess::GetArgument_str(std::string name, std::string& value, std::string defaultValue) {
     if (!name.empty() && name[0] == '-') name.erase(0, 1);
     if (commandLine_.Find(name, value)) return true;
@@ -195,6 +196,7 @@ VqResult BaseProcess::notifyTransmissionStatus(TransferStatusNotify&) {
     return VQ_OK;
 }
 
+// NOLINTNEXTLINE(performance-unnecessary-value-param): the module API's signature
 bool BaseProcess::initializeProcess(std::string) {
     return true;
 }

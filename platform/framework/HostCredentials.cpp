@@ -30,7 +30,8 @@ std::map<std::string, std::string> Properties(const awsauth::AwsCredentials& cre
 
 }  // namespace
 
-HostCredentials::HostCredentials(const FrameworkOptions& options, awsauth::Environment environment)
+HostCredentials::HostCredentials(const FrameworkOptions& options,
+                                 const awsauth::Environment& environment)
     : region_(options.region), localStore_(IsFileEndpoint(options.endpoint)) {
     using awsauth::ChainLink;
     sts_ = std::make_unique<awsauth::StsClient>(

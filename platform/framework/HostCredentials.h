@@ -48,8 +48,9 @@ class HostCredentials {
   public:
     static constexpr std::chrono::seconds kRetryAfterFailure{30};
 
-    explicit HostCredentials(const FrameworkOptions& options,
-                             awsauth::Environment environment = awsauth::ProcessEnvironment());
+    explicit HostCredentials(
+        const FrameworkOptions& options,
+        const awsauth::Environment& environment = awsauth::ProcessEnvironment());
     ~HostCredentials();
     HostCredentials(const HostCredentials&) = delete;
     HostCredentials& operator=(const HostCredentials&) = delete;

@@ -62,56 +62,55 @@ bool ParseTags(const std::string& text, std::vector<std::pair<std::string, std::
     return true;
 }
 
+// Reads option `name` into `field` when `valid` accepts it; otherwise appends `problem` followed
+// by the value given.
+template <typename Valid>
+void readChecked(const CommandLine& cl, const char* name, Valid valid, std::string& field,
+                 const std::string& problem, std::vector<std::string>& errors) {
+    std::string v;
+    if (!cl.Find(name, v)) return;
+    if (valid(v)) {
+        field = v;
+        return;
+    }
+    errors.push_back(problem + ", got \"" + v + "\"");
+}
+
 }  // namespace
 
 UploadOptions UploadOptions::Read(const CommandLine& cl, std::vector<std::string>& errors) {
     UploadOptions o;
-    std::string v;
-    if (cl.Find("sse", v)) {
-        if (v == "AES256" || v == "aws:kms") {
-            o.sse = v;
-        } else {
-            errors.push_back("-sse is AES256 or aws:kms, got \"" + v + "\"");
-        }
-    }
-    if (cl.Find("ssekmskeyid", v)) {
-        if (o.sse == "aws:kms" && !v.empty()) {
-            o.sseKmsKeyId = v;
+    readChecked(
+        cl, "sse", [](const std::string& v) { return v == "AES256" || v == "aws:kms"; }, o.sse,
+        "-sse is AES256 or aws:kms", errors);
+    std::string keyId;
+    if (cl.Find("ssekmskeyid", keyId)) {
+        if (o.sse == "aws:kms" && !keyId.empty()) {
+            o.sseKmsKeyId = keyId;
         } else {
             errors.push_back("-ssekmskeyid needs -sse aws:kms and a key");
         }
     }
-    if (cl.Find("storageclass", v)) {
-        if (OneOf(v, kStorageClasses)) {
-            o.storageClass = v;
-        } else {
-            errors.push_back("-storageclass is one of " + List(kStorageClasses) + ", got \"" + v +
-                             "\"");
-        }
-    }
-    if (cl.Find("acl", v)) {
-        if (OneOf(v, kCannedAcls)) {
-            o.acl = v;
-        } else {
-            errors.push_back("-acl is one of " + List(kCannedAcls) + ", got \"" + v + "\"");
-        }
-    }
-    if (cl.Find("tagging", v)) {
+    readChecked(
+        cl, "storageclass", [](const std::string& v) { return OneOf(v, kStorageClasses); },
+        o.storageClass, "-storageclass is one of " + List(kStorageClasses), errors);
+    readChecked(
+        cl, "acl", [](const std::string& v) { return OneOf(v, kCannedAcls); }, o.acl,
+        "-acl is one of " + List(kCannedAcls), errors);
+    std::string tagging;
+    if (cl.Find("tagging", tagging)) {
         std::vector<std::pair<std::string, std::string>> tags;
         std::string why;
-        if (ParseTags(v, tags, why)) {
-            o.tagging = v;
+        if (ParseTags(tagging, tags, why)) {
+            o.tagging = tagging;
         } else {
             errors.push_back("-tagging: " + why);
         }
     }
-    if (cl.Find("addressing", v)) {
-        if (v == "path" || v == "virtual" || v == "auto") {
-            o.addressing = v;
-        } else {
-            errors.push_back("-addressing is path, virtual or auto, got \"" + v + "\"");
-        }
-    }
+    readChecked(
+        cl, "addressing",
+        [](const std::string& v) { return v == "path" || v == "virtual" || v == "auto"; },
+        o.addressing, "-addressing is path, virtual or auto", errors);
     const char* bundle = std::getenv("AWS_CA_BUNDLE");
     o.caBundle = bundle ? bundle : "";
     return o;

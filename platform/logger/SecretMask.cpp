@@ -3,7 +3,6 @@
 #include <strings.h>
 
 #include <algorithm>
-
 #include <cstring>
 #include <vector>
 
@@ -51,8 +50,8 @@ void findParameters(const char* text, std::vector<Span>* spans) {
             const char* end = eq + 1;
             while (!endsValue(*end)) ++end;
             if (end > eq + 1)
-                spans->push_back({static_cast<size_t>(eq + 1 - text),
-                                  static_cast<size_t>(end - text)});
+                spans->push_back(
+                    {static_cast<size_t>(eq + 1 - text), static_cast<size_t>(end - text)});
             break;
         }
     }

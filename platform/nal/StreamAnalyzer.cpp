@@ -8,6 +8,42 @@ namespace {
 // What the first slice of an access unit says.
 enum class Verdict { KeepLooking, Idr, NotIdr };
 
+// Annex B: the units follow start codes 00 00 01 (a leading zero of a 4-byte code is part of
+// the previous unit's trailing bytes and harmless).
+template <typename Classify>
+bool walkAnnexB(const uint8_t* data, size_t size, Classify classify) {
+    size_t i = 0;
+    while (i + 3 <= size) {
+        if (data[i] != 0 || data[i + 1] != 0 || data[i + 2] != 1) {
+            ++i;
+            continue;
+        }
+        const size_t nal = i + 3;
+        if (nal >= size) return false;
+        // Only the header bytes matter; the length of the unit is not needed.
+        const Verdict v = classify(data + nal, size - nal);
+        if (v != Verdict::KeepLooking) return v == Verdict::Idr;
+        i = nal;
+    }
+    return false;
+}
+
+// Units each preceded by a 4-byte big-endian length.
+template <typename Classify>
+bool walkLengthPrefixed(const uint8_t* data, size_t size, Classify classify) {
+    size_t pos = 0;
+    while (pos + 4 <= size) {
+        const uint32_t length = (uint32_t{data[pos]} << 24) | (uint32_t{data[pos + 1]} << 16) |
+                                (uint32_t{data[pos + 2]} << 8) | uint32_t{data[pos + 3]};
+        pos += 4;
+        if (length == 0 || length > size - pos) return false;
+        const Verdict v = classify(data + pos, length);
+        if (v != Verdict::KeepLooking) return v == Verdict::Idr;
+        pos += length;
+    }
+    return false;
+}
+
 // Calls `classify(firstByteOfNalHeader, bytesLeftInNal)` for each NAL unit in order until it
 // returns a verdict. Unknown framing or a truncated unit ends the walk with NotIdr.
 template <typename Classify>
@@ -15,34 +51,7 @@ bool walkNalUnits(const uint8_t* data, size_t size, Classify classify) {
     if (data == nullptr || size < 4) return false;
     const bool annexB = (data[0] == 0 && data[1] == 0 && data[2] == 1) ||
                         (data[0] == 0 && data[1] == 0 && data[2] == 0 && data[3] == 1);
-    if (annexB) {
-        size_t i = 0;
-        while (i + 3 <= size) {
-            // Find the next start code 00 00 01 at i.
-            if (data[i] == 0 && data[i + 1] == 0 && data[i + 2] == 1) {
-                size_t nal = i + 3;
-                if (nal >= size) return false;
-                // Only the header bytes matter; the length of the unit is not needed.
-                Verdict v = classify(data + nal, size - nal);
-                if (v != Verdict::KeepLooking) return v == Verdict::Idr;
-                i = nal;
-            } else {
-                ++i;
-            }
-        }
-        return false;
-    }
-    size_t pos = 0;
-    while (pos + 4 <= size) {
-        uint32_t length = (uint32_t{data[pos]} << 24) | (uint32_t{data[pos + 1]} << 16) |
-                          (uint32_t{data[pos + 2]} << 8) | uint32_t{data[pos + 3]};
-        pos += 4;
-        if (length == 0 || length > size - pos) return false;
-        Verdict v = classify(data + pos, length);
-        if (v != Verdict::KeepLooking) return v == Verdict::Idr;
-        pos += length;
-    }
-    return false;
+    return annexB ? walkAnnexB(data, size, classify) : walkLengthPrefixed(data, size, classify);
 }
 
 Verdict classifyH264(const uint8_t* nal, size_t left) {
