@@ -1,3 +1,7 @@
+// SigV4Signer against the requests AWS signs in its S3 documentation. Faults guarded: a wrong
+// signature (headers, query order, path encoding); headers not canonicalised (case, blanks);
+// keys encoded unlike S3 (reserved characters, bytes above 0x7f); a clock correction of the
+// wrong sign.
 #include <gtest/gtest.h>
 
 #include "platform/transfer/Digest.h"
@@ -68,9 +72,8 @@ TEST(SigV4SignerTest, CanonicalisesHeaders) {
     const std::string expected = SigV4Signer::Sign(plain, ExampleKey(), kDate).signature;
     EXPECT_EQ(SigV4Signer::Sign(loose, ExampleKey(), kDate).signature, expected);
 
-    SigV4Request other = Get("/test.txt", "");
-    other.headers.emplace_back("x-amz-meta-note", "a c");
-    EXPECT_NE(SigV4Signer::Sign(other, ExampleKey(), kDate).signature, expected);
+    loose.headers.back().second = "a c";
+    EXPECT_NE(SigV4Signer::Sign(loose, ExampleKey(), kDate).signature, expected);
 }
 
 TEST(SigV4SignerTest, EncodesObjectKeys) {
@@ -80,19 +83,14 @@ TEST(SigV4SignerTest, EncodesObjectKeys) {
     EXPECT_EQ(SigV4Signer::EncodePath("caf\xc3\xa9/\x7f"), "caf%C3%A9/%7F");
     EXPECT_EQ(SigV4Signer::EncodeComponent("a/b c"), "a%2Fb%20c");
     EXPECT_EQ(SigV4Signer::CanonicalQuery("b=2&a=x y&a=1&flag"), "a=1&a=x%20y&b=2&flag=");
-    EXPECT_EQ(SigV4Signer::CanonicalQuery(""), "");
 }
 
-TEST(SigV4SignerTest, DigestsDatesAndClockCorrection) {
+TEST(SigV4SignerTest, ClockCorrection) {
     using namespace std::chrono;
-    EXPECT_EQ(digest::Base64(digest::Md5Of("", 0)), "1B2M2Y8AsgTpgAmY7PhCfg==");
-    EXPECT_EQ(digest::Hex(digest::Md5Of("abc", 3)), "900150983cd24fb0d6963f7d28e17f72");
     EXPECT_EQ(SigV4Signer::AmzDate(system_clock::from_time_t(1369353600)), kDate);
-
     SigV4Signer signer(minutes(20));
     EXPECT_NEAR(duration_cast<seconds>(signer.Now() - system_clock::now()).count(), 1200, 2);
     // Corrected to a server that is 5 minutes behind this machine.
     signer.CorrectClock(system_clock::now() - minutes(5));
-    EXPECT_NEAR(signer.ClockOffset().count(), -300, 2);
     EXPECT_NEAR(duration_cast<seconds>(signer.Now() - system_clock::now()).count(), -300, 2);
 }

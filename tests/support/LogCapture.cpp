@@ -38,6 +38,14 @@ size_t LogCapture::Count(const std::string& message) const {
     return Find(message).size();
 }
 
+size_t LogCapture::CountContaining(const std::string& part, const std::string& also) const {
+    size_t n = 0;
+    std::lock_guard<std::mutex> lock(sink_->mutex);
+    for (const auto& r : sink_->records)
+        n += r.message.find(part) != std::string::npos && r.message.find(also) != std::string::npos;
+    return n;
+}
+
 std::vector<std::string> LogCapture::Messages() const {
     std::vector<std::string> messages;
     std::lock_guard<std::mutex> lock(sink_->mutex);

@@ -30,6 +30,8 @@ class LogCapture {
     std::vector<LogRecord> Find(const std::string& message) const;
     size_t Count(const std::string& message) const;
     bool Contains(const std::string& message) const { return Count(message) > 0; }
+    // Records whose message holds `part` (and `also`, when given) anywhere.
+    size_t CountContaining(const std::string& part, const std::string& also = "") const;
     // Messages only, in order.
     std::vector<std::string> Messages() const;
     void Clear();

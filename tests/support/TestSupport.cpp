@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include <cstdio>
+#include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <thread>
@@ -100,6 +101,7 @@ int ChildProcess::Wait(int timeoutMs) {
         ended_ = true;
         if (WIFEXITED(status)) exitStatus_ = WEXITSTATUS(status);
         if (WIFSIGNALED(status)) termSignal_ = WTERMSIG(status);
+        coreDumped_ = WIFSIGNALED(status) && WCOREDUMP(status);
     }
     return exitStatus_;
 }
@@ -141,6 +143,35 @@ std::string ReadFile(const std::string& path) {
     std::stringstream ss;
     ss << in.rdbuf();
     return ss.str();
+}
+
+std::string WriteFile(const std::string& path, const std::string& text) {
+    std::ofstream(path, std::ios::binary) << text;
+    return path;
+}
+
+std::string ScratchDir(const std::string& name) {
+    const std::string dir = BuildPath("scratch/" + name + "-" + std::to_string(getpid()));
+    std::filesystem::remove_all(dir);
+    std::filesystem::create_directories(dir);
+    return dir;
+}
+
+std::function<std::string(const std::string&)> EnvOf(std::map<std::string, std::string> vars) {
+    return [vars = std::move(vars)](const std::string& name) {
+        auto it = vars.find(name);
+        return it == vars.end() ? std::string() : it->second;
+    };
+}
+
+ObjectToStore ObjectFor(const std::string& bucket, const std::string& key,
+                        const std::string& body) {
+    ObjectToStore object;
+    object.bucket = bucket;
+    object.key = key;
+    object.data = reinterpret_cast<const uint8_t*>(body.data());
+    object.size = body.size();
+    return object;
 }
 
 std::string MediaClip(const std::string& fileName, const std::vector<std::string>& args) {

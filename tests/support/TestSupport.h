@@ -4,12 +4,14 @@
 #include <chrono>
 #include <cstdint>
 #include <functional>
+#include <map>
 #include <memory>
 #include <string>
 #include <vector>
 
 #include "platform/framework/ReceivedSample.h"
 #include "platform/framework/StreamData.h"
+#include "platform/transfer/ObjectStore.h"
 
 namespace testsupport {
 
@@ -52,12 +54,15 @@ class ChildProcess {
     int Wait(int timeoutMs);
     bool Ended() const { return ended_; }
     int TermSignal() const { return termSignal_; }  // 0 if it exited or still runs
+    bool CoreDumped() const { return coreDumped_; }
+    int Pid() const { return pid_; }
 
   private:
     int pid_ = -1;
     bool ended_ = false;
     int exitStatus_ = -1;
     int termSignal_ = 0;
+    bool coreDumped_ = false;
 };
 
 // `text` split at spaces, for compact argument lists: Words("-c copy -f mpegts").
@@ -72,5 +77,15 @@ std::string MediaClip(const std::string& fileName, const std::vector<std::string
 
 // Reads a whole file; empty when it cannot be read.
 std::string ReadFile(const std::string& path);
+// Writes `text` to `path`, replacing what was there; returns `path`.
+std::string WriteFile(const std::string& path, const std::string& text);
+// A fresh, empty directory in the build tree for one test's files: `name` and the process id.
+std::string ScratchDir(const std::string& name);
+
+// An environment as code that takes one as a function sees it: the value, "" when unset.
+std::function<std::string(const std::string&)> EnvOf(std::map<std::string, std::string> vars);
+
+// An object of `body` under `bucket` and `key`; not copied, so `body` must outlive it.
+ObjectToStore ObjectFor(const std::string& bucket, const std::string& key, const std::string& body);
 
 }  // namespace testsupport
