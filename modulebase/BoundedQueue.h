@@ -1,7 +1,9 @@
 // BoundedQueue<T>: a bounded FIFO shared by producer threads and one consumer.
 //
-// With drop-when-full (always set here) a full queue refuses the newest item and Push never
-// blocks. Pop blocks until an item is there. Clear filters the queue through the removal
+// A full queue refuses the newest item: Push never blocks. A producer that would rather wait
+// than lose an item (a file input) asks WaitForRoom first; the consumer wakes it only once the
+// room it asked for is there, so a waiting producer wakes once per drained stretch, not once
+// per item. Pop blocks until an item is there. Clear filters the queue through the removal
 // predicate (true = remove). Every member takes the queue's own mutex; no callback but the
 // predicate runs under it.
 //
@@ -10,6 +12,8 @@
 // ticket t has seen everything pushed before it.
 #pragma once
 
+#include <algorithm>
+#include <chrono>
 #include <condition_variable>
 #include <cstdint>
 #include <deque>
@@ -30,11 +34,8 @@ class BoundedQueue {
     // True when appended; false when refused (full), the item is then released. `ticket`
     // (optional) receives the item's ticket when appended.
     bool Push(T item, uint64_t* ticket = nullptr) {
-        std::unique_lock<std::mutex> lock(mutex_);
-        if (items_.size() >= capacity_) {
-            if (dropWhenFull_) return false;  // `item` is released when this frame ends
-            notFull_.wait(lock, [this] { return items_.size() < capacity_; });
-        }
+        std::lock_guard<std::mutex> lock(mutex_);
+        if (items_.size() >= capacity_) return false;  // `item` is released when this frame ends
         items_.push_back(Entry{std::move(item), ++lastTicket_});
         if (ticket) *ticket = lastTicket_;
         notEmpty_.notify_one();
@@ -48,7 +49,7 @@ class BoundedQueue {
         notEmpty_.wait(lock, [this] { return !items_.empty(); });
         Entry entry = std::move(items_.front());
         items_.pop_front();
-        notFull_.notify_one();
+        wakeRoomWaiter();
         if (ticket) *ticket = entry.ticket;
         return std::move(entry.item);
     }
@@ -64,7 +65,35 @@ class BoundedQueue {
             items_.pop_front();
         }
         for (auto& entry : kept) items_.push_back(std::move(entry));
-        notFull_.notify_one();
+        wakeRoomWaiter();
+    }
+
+    // Blocks until the queue has room for `room` more items (at most its capacity), until
+    // `deadline`, or until waits are ended; true when the room is there. One waiter at a time:
+    // the room is only guaranteed to the single producer that waited for it.
+    bool WaitForRoom(uint64_t room, std::chrono::steady_clock::time_point deadline) {
+        std::unique_lock<std::mutex> lock(mutex_);
+        const uint64_t wanted = std::min(std::max<uint64_t>(room, 1), capacity_);
+        const auto roomy = [&] { return capacity_ - items_.size() >= wanted; };
+        if (roomy()) return true;
+        roomWanted_ = wanted;
+        notFull_.wait_until(lock, deadline, [&] { return waitsEnded_ || roomy(); });
+        roomWanted_ = 0;
+        return roomy();
+    }
+
+    // EndWaits makes every WaitForRoom, current or later, return at once (with the room as it
+    // is) until AllowWaits. A queue starts with waits ended: there is no consumer yet.
+    void EndWaits() {
+        {
+            std::lock_guard<std::mutex> lock(mutex_);
+            waitsEnded_ = true;
+        }
+        notFull_.notify_all();
+    }
+    void AllowWaits() {
+        std::lock_guard<std::mutex> lock(mutex_);
+        waitsEnded_ = false;
     }
 
     BoundedQueue& operator=(std::function<bool(T)> predicate) {
@@ -79,16 +108,22 @@ class BoundedQueue {
     }
 
   private:
+    // Caller holds mutex_. Wakes the waiting producer once the room it asked for is there.
+    void wakeRoomWaiter() {
+        if (roomWanted_ != 0 && capacity_ - items_.size() >= roomWanted_) notFull_.notify_one();
+    }
+
     struct Entry {
         T item;
         uint64_t ticket;
     };
     std::deque<Entry> items_;  // oldest at the front
     const uint64_t capacity_;
-    bool dropWhenFull_ = true;
+    uint64_t roomWanted_ = 0;  // room the waiting producer asked for; 0: nobody waits
+    bool waitsEnded_ = true;
     uint64_t lastTicket_ = 0;  // ticket of the newest accepted item
     mutable std::mutex mutex_;
-    std::condition_variable notFull_;
+    std::condition_variable notFull_;  // WaitForRoom's wait
     std::condition_variable notEmpty_;
     std::function<bool(T)> removePredicate_;
 };

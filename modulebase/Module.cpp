@@ -44,6 +44,16 @@ void Module::ClearQueues() {
     for (Lane& lane : lanes_) lane.queue.Clear();
 }
 
+bool Module::WaitForRoom(size_t video, size_t audio, size_t meta,
+                         std::chrono::steady_clock::time_point deadline) {
+    const size_t wanted[kMediaCount] = {video, audio, meta};
+    for (int media = kVideo; media < kMediaCount; ++media) {
+        if (wanted[media] != 0 && !lanes_[media].queue.WaitForRoom(wanted[media], deadline))
+            return false;
+    }
+    return true;
+}
+
 bool Module::Initialize(std::shared_ptr<void> parameter) {
     auto keepMarkers = [](std::shared_ptr<StreamData> item) {
         return !item || item->payloadSize != 0;
@@ -57,11 +67,15 @@ void Module::StartThreads() {
         lanes_[media].running = true;
         lanes_[media].worker =
             std::make_shared<std::thread>(&Module::workerLoop, this, static_cast<Media>(media));
+        lanes_[media].queue.AllowWaits();
     }
 }
 
 void Module::StopThreads() {
-    for (Lane& lane : lanes_) lane.running = false;
+    for (Lane& lane : lanes_) {
+        lane.running = false;
+        lane.queue.EndWaits();
+    }
     auto marker = std::make_shared<StreamData>();
     for (Lane& lane : lanes_) {
         lane.queue.Clear();

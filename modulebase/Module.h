@@ -2,7 +2,9 @@
 //
 // Owns three bounded queues (video 50, audio 20, meta 20 samples) and one worker thread per
 // queue. Producers (any thread) only enqueue and never block: a full queue drops the newest
-// sample with one "queue overflow (...)" line. Each worker pops its queue in order and calls
+// sample with one "queue overflow (...)" line. That suits a live input, where waiting would only
+// move the loss into the socket; an input that can wait (a file) asks WaitForRoom before it
+// pushes and so never loses a sample. Each worker pops its queue in order and calls
 // the derived class's Process* hook; no Module lock is held while a hook runs, so the three
 // hooks run concurrently and the derived class synchronises what they share.
 //
@@ -12,6 +14,7 @@
 #pragma once
 
 #include <atomic>
+#include <chrono>
 #include <condition_variable>
 #include <cstdint>
 #include <memory>
@@ -37,6 +40,12 @@ class Module : public ModuleInterface {
     void FlushQueues() override;
     // Removes every queued real sample; markers stay.
     void ClearQueues() override;
+    // Blocks until the video, audio and meta queues have room for `video`, `audio` and `meta`
+    // more samples (each at most its queue's capacity), woken by the workers as they take
+    // samples; false at `deadline`, or at once when the workers are not running or being
+    // stopped (StopThreads ends a wait at once). One producer waits at a time.
+    bool WaitForRoom(size_t video, size_t audio, size_t meta,
+                     std::chrono::steady_clock::time_point deadline) override;
 
     // Makes Clear keep markers and drop samples, then calls OnInitialize.
     bool Initialize(std::shared_ptr<void> parameter);

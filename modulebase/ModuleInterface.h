@@ -3,6 +3,8 @@
 // hooks a concrete module implements.
 #pragma once
 
+#include <chrono>
+#include <cstddef>
 #include <memory>
 
 class StreamData;
@@ -18,6 +20,10 @@ class ModuleInterface {
     // Waits until every worker has handled everything queued before the call.
     virtual void FlushQueues() = 0;
     virtual void ClearQueues() = 0;
+    // Flow control for a producer that can wait: blocks until the queues can take that many
+    // more samples of each medium without dropping one; false at the deadline or on stop.
+    virtual bool WaitForRoom(size_t video, size_t audio, size_t meta,
+                             std::chrono::steady_clock::time_point deadline) = 0;
     virtual bool OnInitialize(std::shared_ptr<void> parameter) = 0;
     virtual void OnStop() = 0;
     virtual void OnStart() = 0;

@@ -170,6 +170,12 @@ bool ProcessControl::drainProcess(int64_t timeoutMs) {
     return complete;
 }
 
+bool ProcessControl::waitForSampleRoom(size_t video, size_t audio, size_t meta,
+                                       std::chrono::steady_clock::time_point deadline) {
+    if (!running_.load()) return true;
+    return module_->WaitForRoom(video, audio, meta, deadline);
+}
+
 void ProcessControl::notifyVideoData(std::shared_ptr<ReceivedSample> sample) {
     auto data = std::make_shared<StreamData>(std::move(sample));
     if (running_.load()) module_->PushVideo(std::move(data));

@@ -174,22 +174,25 @@ int FreePort(int type) {
 TEST(EndToEndTest, StoredObjectsDecodeToTheInputsFrames) {
     const struct {
         std::string clip, codec, interval;
-        int gop;  // 0: IDRs at scene cuts, B-frames (3 at most)
-    } cases[] = {{Clip("e2e_h264.mp4", 5, kX264Gop30), "h264", "1", 30},
+        int gop;           // 0: IDRs at scene cuts, B-frames (3 at most)
+        std::string rate;  // -readrate; 0 reads as fast as the recorder stores
+    } cases[] = {{Clip("e2e_h264.mp4", 5, kX264Gop30), "h264", "1", 30, "10"},
+                 {Clip("e2e_h264.mp4", 5, kX264Gop30), "h264", "1", 30, "0"},
                  {Clip("e2e_h264_bframes.ts", 6,
                        "-c:v libx264 -preset veryfast -g 90 -keyint_min 15 -sc_threshold 40 -bf 3",
                        ",negate=enable='lt(mod(t,3.7),1.3)'"),
-                  "h264", "4", 0},
+                  "h264", "4", 0, "10"},
                  {Clip("e2e_h265.mp4", 5,
                        "-c:v libx265 -preset ultrafast -x265-params "
                        "keyint=30:min-keyint=30:scenecut=0:open-gop=0:bframes=0:log-level=error"),
-                  "h265", "1", 30}};
+                  "h265", "1", 30, "10"}};
     for (const auto& c : cases) {
-        SCOPED_TRACE(c.clip);
+        SCOPED_TRACE(c.clip + " -readrate " + c.rate);
         ASSERT_FALSE(c.clip.empty());
-        const std::string dir = Scratch("frames-" + c.codec + "-" + std::to_string(c.gop));
+        const std::string dir =
+            Scratch("frames-" + c.codec + "-" + std::to_string(c.gop) + "-" + c.rate);
         auto r = RunProcess(RecorderArgs(c.clip, dir,
-                                         {"-kct", c.codec, "-readrate", "10", "-uploadinterval",
+                                         {"-kct", c.codec, "-readrate", c.rate, "-uploadinterval",
                                           c.interval, "-endpoint", Store(dir)}),
                             120000);
         const std::string log = ReadFile(dir + "/log.txt");
@@ -208,19 +211,8 @@ TEST(EndToEndTest, StoredObjectsDecodeToTheInputsFrames) {
         const size_t k = std::find(input.begin(), input.end(), stored.front()) - input.begin();
         ASSERT_LT(k, input.size());
         EXPECT_TRUE(c.gop == 0 || k % c.gop == 0) << "the first stored frame is not an IDR";
-        // The file is read at ten times real time and a full module queue drops the newest
-        // sample, so a busy machine may lose frames: then the stored frames must still be
-        // input frames in input order, but the exact checks below (every frame, the summed
-        // durations, each object decoding without an error) do not apply.
-        if (log.find("queue overflow") != std::string::npos) {
-            auto next = input.begin() + k;
-            for (const auto& frame : stored) {
-                next = std::find(next, input.end(), frame);
-                ASSERT_NE(next, input.end()) << "a stored frame out of order or not in the input";
-                ++next;
-            }
-            continue;
-        }
+        // A file waits for room in the module's queues however busy the machine is.
+        EXPECT_EQ(log.find("queue overflow"), std::string::npos) << log;
         // The end of the file is drained: the stored frames run from there to the input's last.
         ASSERT_EQ(k + stored.size(), input.size());
         EXPECT_TRUE(std::equal(stored.begin(), stored.end(), input.begin() + k));

@@ -1,6 +1,7 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <chrono>
 #include <condition_variable>
 #include <cstdlib>
 #include <mutex>
@@ -251,6 +252,49 @@ TEST(ModuleWorkers, AFlushWaitsForTheSamplesBeforeItWhereAnEarlierMarkerLay) {
         flusher.join();
         EXPECT_EQ(handledAtReturn, 10u);
     }
+}
+
+// A producer that waits for room loses nothing behind a stalled worker; stopping the workers
+// ends its wait.
+TEST(ModuleConcurrency, AWaitingProducerLosesNothingAndStopEndsItsWait) {
+    LogCapture log;
+    RecordingModule module;
+    module.Initialize(nullptr);
+    const auto far = [] { return std::chrono::steady_clock::now() + std::chrono::minutes(5); };
+    for (int i = 0; i < 20; ++i) module.PushAudio(MakeSample(i));  // full
+    EXPECT_FALSE(module.WaitForRoom(0, 1, 0, far())) << "no workers yet: no wait";
+    module.StartThreads();
+    ASSERT_TRUE(module.HoldVideoAt(0));
+    std::atomic<uint64_t> pushed{0};
+    std::thread producer([&] {
+        for (uint64_t t = 1; t <= 120; ++t) {
+            if (!module.WaitForRoom(1, 0, 0, far())) return;
+            module.PushVideo(MakeSample(t));
+            pushed = t;
+        }
+    });
+    ASSERT_TRUE(WaitUntil([&] { return pushed.load() == 50; }));  // the queue is full
+    module.Release();
+    producer.join();
+    ASSERT_TRUE(WaitUntil([&] { return module.Count(module.video) == 121; }));
+    std::vector<uint64_t> inOrder(121);
+    std::iota(inOrder.begin(), inOrder.end(), 0);
+    EXPECT_EQ(module.Copy(module.video), inOrder);
+    EXPECT_EQ(log.Count("queue overflow"), 0u);
+
+    {
+        std::lock_guard<std::mutex> lock(module.mutex);
+        module.videoEntered = false;
+    }
+    ASSERT_TRUE(module.HoldVideoAt(200));
+    for (uint64_t t = 201; t <= 250; ++t) module.PushVideo(MakeSample(t));
+    std::atomic<int> waited{-1};
+    std::thread waiter([&] { waited = module.WaitForRoom(1, 0, 0, far()); });
+    std::thread stopper([&] { module.StopThreads(); });  // joins the held worker
+    ASSERT_TRUE(WaitUntil([&] { return waited.load() != -1; }));
+    module.Release();
+    waiter.join();
+    stopper.join();
 }
 
 TEST(ModuleConcurrency, ProducersAndStopRaceCleanly) {

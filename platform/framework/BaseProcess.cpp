@@ -196,6 +196,10 @@ VqResult BaseProcess::notifyTransmissionStatus(TransferStatusNotify&) {
     return VQ_OK;
 }
 
+bool BaseProcess::waitForSampleRoom(size_t, size_t, size_t, std::chrono::steady_clock::time_point) {
+    return true;
+}
+
 // NOLINTNEXTLINE(performance-unnecessary-value-param): the module API's signature
 bool BaseProcess::initializeProcess(std::string) {
     return true;

@@ -16,6 +16,8 @@
 // Status and send calls are safe for concurrent callers.
 #pragma once
 
+#include <chrono>
+#include <cstddef>
 #include <cstdint>
 #include <map>
 #include <memory>
@@ -133,6 +135,12 @@ class BaseProcess : public IVqModuleMessageObserver,
     // that says why, when the module cannot record it. The base accepts every input.
     virtual bool checkInput(const InputInfo& input);
 
+    // Flow control for an input that can wait (a file), on the receive thread before it hands
+    // samples over: blocks until the module can take `video`, `audio` and `meta` more samples
+    // without dropping one, or until `deadline`; true when it can. A live input never calls
+    // it. The base drops every sample and returns true at once.
+    virtual bool waitForSampleRoom(size_t video, size_t audio, size_t meta,
+                                   std::chrono::steady_clock::time_point deadline);
     // Sample hooks (receive threads): the base drops the samples.
     void notifyVideoData(std::shared_ptr<ReceivedSample>) override {}
     void notifyAudioData(std::shared_ptr<ReceivedSample>) override {}

@@ -189,10 +189,15 @@ void MediaHost::receive(BaseProcess& process) {
     MediaInput::Packet packet;
     // A paced input hands over the packets that are due together, right before the pacer
     // waits: each worker then wakes once per burst rather than once per packet. A burst is
-    // bounded by the pacer's slack and by kMaxBatch, so it fits the module's queues.
-    std::vector<std::pair<MediaInput::Packet, SampleClock::Times>> batch;
+    // bounded by the pacer's slack and by kMaxBatch, so it fits the module's queues. An
+    // unpaced file goes in bursts of kMaxBatch. A file waits for room in the module's queues
+    // before each burst and so never loses a sample; a stop during that wait discards the
+    // burst as if it had not been read.
+    Batch batch;
     auto flush = [&] {
-        for (const auto& [p, t] : batch) deliver(process, p, t);
+        if (live_ || batch.empty() || waitForRoom(process, batch)) {
+            for (const auto& [p, t] : batch) deliver(process, p, t);
+        }
         batch.clear();
     };
     struct FlushAtExit {
@@ -235,8 +240,11 @@ void MediaHost::receive(BaseProcess& process) {
             endReason_ = "duration reached";
             return;
         }
-        if (!pacer.Paced()) {
-            deliver(process, packet, times);
+        if (live_) {
+            deliver(process, packet, times);  // a live input is not paced and cannot wait
+        } else if (!pacer.Paced()) {
+            batch.emplace_back(packet, times);
+            if (batch.size() >= kMaxBatch) flush();
         } else {
             if (!pacer.IsDue(times.dtsUs) || batch.size() >= kMaxBatch) flush();
             if (!pacer.Pace(times.dtsUs)) {
@@ -247,6 +255,18 @@ void MediaHost::receive(BaseProcess& process) {
         }
         reopenPause_ = kFirstReopenPause;  // the input works again
     }
+}
+
+bool MediaHost::waitForRoom(BaseProcess& process, const Batch& batch) {
+    size_t counts[SampleClock::kTrackCount] = {0, 0, 0};
+    for (const auto& entry : batch) ++counts[entry.first.track];
+    while (!stop_.Raised()) {
+        if (process.waitForSampleRoom(counts[SampleClock::kVideo], counts[SampleClock::kAudio],
+                                      counts[SampleClock::kMeta],
+                                      std::chrono::steady_clock::now() + kRoomWaitSlice))
+            return true;
+    }
+    return false;
 }
 
 void MediaHost::deliver(BaseProcess& process, const MediaInput::Packet& packet,

@@ -6,10 +6,11 @@
 // Run (message thread, after startProcess):
 //   1. delivers the connection reply, then the credentials once when it has them;
 //   2. starts the receive thread, which reads the input, keeps the clock sound (SampleClock),
-//      paces a file input by `-readrate` (Pacer) and calls notifyVideoData / notifyAudioData /
-//      notifyMetaData with one ReceivedSample per packet; a live input that fails or stays
-//      silent is reopened with a growing pause (1 s doubling up to 30 s) and never ends by
-//      itself;
+//      paces a file input by `-readrate` (Pacer), waits for room in the module's queues
+//      before it hands a file's packets over (waitForSampleRoom), and calls notifyVideoData /
+//      notifyAudioData / notifyMetaData with one ReceivedSample per packet; a live input
+//      that fails or stays silent is reopened with a growing pause (1 s doubling up to 30 s)
+//      and never ends by itself;
 //   3. waits for that thread to end: the file's end, `-duration` seconds of input, the first
 //      SIGINT/SIGTERM, or Stop();
 //   4. asks the module to store what it holds (drainProcess with `-draintimeout`) and
@@ -34,6 +35,8 @@
 #include <memory>
 #include <string>
 #include <thread>
+#include <utility>
+#include <vector>
 
 #include "platform/framework/BaseProcess.h"
 #include "platform/framework/HostCredentials.h"
@@ -49,6 +52,9 @@ class MediaHost : public IModuleHost {
     // Packets handed over together at most: fits the smallest module queue (20).
     static constexpr size_t kMaxBatch = 16;
     static constexpr std::chrono::seconds kLongestReopenPause{30};
+    // A file input waits for room in the module's queues in slices this long, so that Stop
+    // ends the wait within one slice (the module's workers end it at once when they stop).
+    static constexpr std::chrono::milliseconds kRoomWaitSlice{100};
 
     // `handleSignals`: install the SIGINT/SIGTERM handlers while Run runs (the process's host
     // does; in-process tests do not).
@@ -71,6 +77,9 @@ class MediaHost : public IModuleHost {
     // Hands credentials to the module; logs why when there are none.
     static void handOver(BaseProcess& process, const credentials::Result& credentials,
                          const char* occasion);
+    using Batch = std::vector<std::pair<MediaInput::Packet, SampleClock::Times>>;
+    // A file input: waits until the module can take the whole batch; false when stopped first.
+    bool waitForRoom(BaseProcess& process, const Batch& batch);
     void deliver(BaseProcess& process, const MediaInput::Packet& packet,
                  const SampleClock::Times& times);
     // Reopens the live input after `why`; false when stopped meanwhile.
