@@ -11,6 +11,7 @@ extern "C" {
 #include <algorithm>
 
 #include "platform/logger/Logger.h"
+#include "platform/logger/SecretMask.h"
 
 namespace {
 
@@ -93,13 +94,7 @@ bool MediaInput::IsLive(const std::string& url) {
 }
 
 std::string MediaInput::Redacted(const std::string& url) {
-    size_t scheme = url.find("://");
-    if (scheme == std::string::npos) return url;
-    size_t hostStart = scheme + 3;
-    size_t hostEnd = url.find_first_of("/?#", hostStart);
-    size_t at = url.rfind('@', hostEnd == std::string::npos ? std::string::npos : hostEnd);
-    if (at == std::string::npos || at < hostStart) return url;
-    return url.substr(0, hostStart) + "***@" + url.substr(at + 1);
+    return MaskedSecrets(url);
 }
 
 int MediaInput::interrupted(void* opaque) {

@@ -75,7 +75,7 @@ class MediaInput {
 
     // A file (no URL scheme, or file:) is not live; every other URL is.
     static bool IsLive(const std::string& url);
-    // The URL without any "user:password@" part, for log lines.
+    // The URL with its user information and query secrets masked (SecretMask.h), for messages.
     static std::string Redacted(const std::string& url);
 
   private:

@@ -78,3 +78,8 @@ bool MaskSecrets(const char* text, std::string* masked) {
     masked->append(text + at);
     return true;
 }
+
+std::string MaskedSecrets(const std::string& text) {
+    std::string masked;
+    return MaskSecrets(text.c_str(), &masked) ? masked : text;
+}

@@ -16,3 +16,6 @@
 // True with *masked the text with every secret replaced by "***"; false (and *masked
 // untouched) when the text holds none.
 bool MaskSecrets(const char* text, std::string* masked);
+
+// `text` with its secrets masked, for texts built before they are logged (messages, ids).
+std::string MaskedSecrets(const std::string& text);

@@ -5,6 +5,7 @@
 #include <cctype>
 #include <climits>
 
+#include "platform/logger/SecretMask.h"
 #include "platform/transfer/HttpText.h"
 #include "platform/transfer/ObjectKey.h"
 #include "platform/transfer/S3Store.h"
@@ -23,19 +24,9 @@ bool isDirectory(const std::string& path) {
     return stat(path.c_str(), &s) == 0 && S_ISDIR(s.st_mode);
 }
 
-// The URL without "user:password@", for messages.
-std::string withoutUserInfo(const std::string& url) {
-    size_t scheme = url.find("://");
-    size_t hostStart = scheme == std::string::npos ? 0 : scheme + 3;
-    size_t hostEnd = url.find_first_of("/?#", hostStart);
-    size_t at = url.rfind('@', hostEnd == std::string::npos ? std::string::npos : hostEnd);
-    if (at == std::string::npos || at < hostStart) return url;
-    return url.substr(0, hostStart) + "***@" + url.substr(at + 1);
-}
-
 bool checkEndpoint(const FrameworkOptions& options, const std::string& bucketName,
                    std::string* why) {
-    const std::string shown = "-endpoint \"" + withoutUserInfo(options.endpoint) + "\"";
+    const std::string shown = "-endpoint \"" + MaskedSecrets(options.endpoint) + "\"";
     if (!startsWithNoCase(options.endpoint, "file:")) {
         S3StoreConfig config;
         std::string fault;
