@@ -1,6 +1,7 @@
 #include "platform/framework/FfmpegLog.h"
 
 extern "C" {
+#include <libavutil/error.h>
 #include <libavutil/log.h>
 }
 
@@ -41,4 +42,10 @@ void forward(void* avClass, int level, const char* format, va_list args) {
 void RouteFfmpegLogToLogger() {
     static std::once_flag once;
     std::call_once(once, [] { av_log_set_callback(&forward); });
+}
+
+std::string FfmpegErrorText(int code) {
+    char text[AV_ERROR_MAX_STRING_SIZE] = {0};
+    av_strerror(code, text, sizeof text);
+    return text;
 }

@@ -10,6 +10,7 @@ extern "C" {
 
 #include <algorithm>
 
+#include "platform/framework/FfmpegLog.h"
 #include "platform/logger/Logger.h"
 #include "platform/logger/SecretMask.h"
 
@@ -17,12 +18,6 @@ namespace {
 
 constexpr const char* kFile = "platform/framework/MediaInput";
 const AVRational kMicros{1, 1000000};
-
-std::string avError(int code) {
-    char text[AV_ERROR_MAX_STRING_SIZE] = {0};
-    av_strerror(code, text, sizeof text);
-    return text;
-}
 
 int64_t steadyNs() {
     return std::chrono::duration_cast<std::chrono::nanoseconds>(
@@ -140,12 +135,12 @@ bool MediaInput::openDemuxer(const std::string& shown, std::string* error) {
                  (stop_.Raised() ? std::string("stopped")
                   : rc == AVERROR_EXIT
                       ? "nothing arrived within " + std::to_string(kSilenceTimeout.count()) + " s"
-                      : avError(rc));
+                      : FfmpegErrorText(rc));
         return false;
     }
     rc = avformat_find_stream_info(s.context, nullptr);
     if (rc < 0) {
-        *error = "cannot read the tracks of input \"" + shown + "\": " + avError(rc);
+        *error = "cannot read the tracks of input \"" + shown + "\": " + FfmpegErrorText(rc);
         return false;
     }
     deadlineNs_.store(0);
@@ -225,7 +220,7 @@ bool MediaInput::setUpAnnexBFilter(const AVStream& stream, std::string* error) {
     s.filter->time_base_in = stream.time_base;
     int rc = av_bsf_init(s.filter);
     if (rc < 0) {
-        *error = std::string("cannot set up the ") + name + " filter: " + avError(rc);
+        *error = std::string("cannot set up the ") + name + " filter: " + FfmpegErrorText(rc);
         return false;
     }
     return true;
@@ -261,7 +256,8 @@ MediaInput::Status MediaInput::takeFiltered(AVPacket** out, std::string* error) 
         s.filterHasOutput = false;
         if (rc != AVERROR(EAGAIN) && rc != AVERROR_EOF) {
             Logger::Put(5, kFile, "MediaInput::Read", __LINE__,
-                        "the Annex B filter dropped a video packet: %s", avError(rc).c_str());
+                        "the Annex B filter dropped a video packet: %s",
+                        FfmpegErrorText(rc).c_str());
         }
         return Status::kPacket;
     }
@@ -279,7 +275,7 @@ MediaInput::Status MediaInput::takeDemuxed(SampleClock::Track* role, AVPacket** 
         if (rc == AVERROR_EOF) return Status::kEnd;
         *error = rc == AVERROR_EXIT
                      ? "no packet for " + std::to_string(kSilenceTimeout.count()) + " s"
-                     : avError(rc);
+                     : FfmpegErrorText(rc);
         return Status::kFailed;
     }
     *role = SampleClock::kTrackCount;
@@ -296,7 +292,8 @@ MediaInput::Status MediaInput::takeDemuxed(SampleClock::Track* role, AVPacket** 
         if (sent < 0) {
             av_packet_unref(s.packet);
             Logger::Put(5, kFile, "MediaInput::Read", __LINE__,
-                        "the Annex B filter refused a video packet: %s", avError(sent).c_str());
+                        "the Annex B filter refused a video packet: %s",
+                        FfmpegErrorText(sent).c_str());
             return Status::kPacket;
         }
         s.filterHasOutput = true;
