@@ -12,17 +12,17 @@ void putLE(SampleAttributes::Block& block, size_t offset, uint64_t value, size_t
 
 SampleAttributes::Block SampleAttributes::Encode() const {
     Block block{};
-    putLE(block, 0, rtpTime, 8);
-    putLE(block, 8, timestamp, 8);
-    putLE(block, 24, attribute4, 4);
-    putLE(block, 28, attribute5, 4);
-    block[32] = attribute6 ? 1 : 0;
-    putLE(block, 48, attribute3[0], 8);
-    putLE(block, 56, attribute3[1], 8);
-    putLE(block, 64, attribute1, 8);
-    putLE(block, 72, attribute2, 8);
-    putLE(block, 80, payloadSize, 8);
-    putLE(block, 88, attribute7, 8);
+    putLE(block, At::kRtpTime, rtpTime, 8);
+    putLE(block, At::kTimestamp, timestamp, 8);
+    putLE(block, At::kAttribute4, attribute4, 4);
+    putLE(block, At::kAttribute5, attribute5, 4);
+    block[At::kAttribute6] = attribute6 ? 1 : 0;
+    putLE(block, At::kAttribute3, attribute3[0], 8);
+    putLE(block, At::kAttribute3 + 8, attribute3[1], 8);
+    putLE(block, At::kAttribute1, attribute1, 8);
+    putLE(block, At::kAttribute2, attribute2, 8);
+    putLE(block, At::kPayloadSize, payloadSize, 8);
+    putLE(block, At::kAttribute7, attribute7, 8);
     return block;
 }
 

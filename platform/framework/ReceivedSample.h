@@ -35,6 +35,14 @@ struct SampleAttributes {
     uint64_t payloadSize = 0;         // bytes 80..87
     uint64_t attribute7 = 0;          // bytes 88..95: packet number within the track
 
+    // Byte positions of the fields in the block, the one place both the writer (Encode) and
+    // the reader (StreamData) take them from.
+    struct At {
+        static constexpr size_t kRtpTime = 0, kTimestamp = 8, kAttribute4 = 24, kAttribute5 = 28,
+                                kAttribute6 = 32, kAttribute3 = 48, kAttribute1 = 64,
+                                kAttribute2 = 72, kPayloadSize = 80, kAttribute7 = 88;
+    };
+
     using Block = std::array<uint8_t, 96>;
     Block Encode() const;
 };
