@@ -7,24 +7,13 @@
 #include <ctime>
 #include <nlohmann/json.hpp>
 
-namespace {
+#include "platform/transfer/UtcTime.h"
 
-std::string utcNow() {
-    auto now = std::chrono::system_clock::now();
-    auto ms = std::chrono::duration_cast<std::chrono::milliseconds>(now.time_since_epoch()).count();
-    std::time_t seconds = static_cast<std::time_t>(ms / 1000);
-    std::tm tm{};
-    gmtime_r(&seconds, &tm);
-    char buf[96];
-    std::snprintf(buf, sizeof buf, "%04d-%02d-%02dT%02d:%02d:%02d.%03dZ", tm.tm_year + 1900,
-                  tm.tm_mon + 1, tm.tm_mday, tm.tm_hour, tm.tm_min, tm.tm_sec,
-                  static_cast<int>(ms % 1000));
-    return buf;
-}
+namespace {
 
 nlohmann::ordered_json header(const char* message, const std::string& destination) {
     nlohmann::ordered_json j;
-    j["time"] = utcNow();
+    j["time"] = IsoUtcTime(UtcNowMicros());
     j["message"] = message;
     j["destination"] = destination;
     return j;

@@ -5,21 +5,9 @@
 #include <cstdio>
 
 #include "platform/transfer/HttpText.h"
+#include "platform/transfer/UtcTime.h"
 
 namespace {
-
-struct UtcParts {
-    struct tm calendar {};
-    unsigned milliseconds = 0;
-};
-
-UtcParts split(uint64_t micros) {
-    UtcParts parts;
-    time_t seconds = static_cast<time_t>(micros / 1000000);
-    parts.milliseconds = static_cast<unsigned>((micros / 1000) % 1000);
-    gmtime_r(&seconds, &parts.calendar);
-    return parts;
-}
 
 bool printableNotPercent(unsigned char c) {
     return c >= 0x20 && c < 0x7f && c != '%';
@@ -39,32 +27,10 @@ uint64_t FirstCaptureTime(const FileTransferRequest& request) {
     return earliest;
 }
 
-std::string CompactUtcTime(uint64_t micros) {
-    UtcParts t = split(micros);
-    char text[64];
-    std::snprintf(text, sizeof(text), "%04d%02d%02dT%02d%02d%02d.%03uZ", t.calendar.tm_year + 1900,
-                  t.calendar.tm_mon + 1, t.calendar.tm_mday, t.calendar.tm_hour, t.calendar.tm_min,
-                  t.calendar.tm_sec, t.milliseconds);
-    return text;
-}
-
-std::string IsoUtcTime(uint64_t micros) {
-    UtcParts t = split(micros);
-    char text[64];
-    std::snprintf(text, sizeof(text), "%04d-%02d-%02dT%02d:%02d:%02d.%03uZ",
-                  t.calendar.tm_year + 1900, t.calendar.tm_mon + 1, t.calendar.tm_mday,
-                  t.calendar.tm_hour, t.calendar.tm_min, t.calendar.tm_sec, t.milliseconds);
-    return text;
-}
-
 std::string ObjectKey(const std::string& keyPrefix, const std::string& streamingId,
                       int64_t sequenceNumber, uint64_t captureMicros,
                       const std::string& extension) {
-    UtcParts t = split(captureMicros);
-    char day[32];
-    std::snprintf(day, sizeof(day), "%04d/%02d/%02d", t.calendar.tm_year + 1900,
-                  t.calendar.tm_mon + 1, t.calendar.tm_mday);
-    return keyPrefix + streamingId + "/" + day + "/" + streamingId + "_" +
+    return keyPrefix + streamingId + "/" + UtcDatePath(captureMicros) + "/" + streamingId + "_" +
            CompactUtcTime(captureMicros) + "_" + std::to_string(sequenceNumber) + extension;
 }
 

@@ -12,15 +12,11 @@
 #include <string>
 
 #include "platform/transfer/FileTransfer.h"
+#include "platform/transfer/UtcTime.h"
 
 // Capture time of the request's first sample: the earliest attribute1 (µs since the Unix
 // epoch) among the first samples of the three lists; 0 when the request has no samples.
 uint64_t FirstCaptureTime(const FileTransferRequest& request);
-
-// `micros` (µs since the Unix epoch) as 20261206T110010.012Z.
-std::string CompactUtcTime(uint64_t micros);
-// `micros` as 2026-12-06T11:00:10.012Z.
-std::string IsoUtcTime(uint64_t micros);
 
 // `extension` is the segment format's (".ts").
 std::string ObjectKey(const std::string& keyPrefix, const std::string& streamingId,
