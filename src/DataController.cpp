@@ -218,9 +218,8 @@ bool DataController::WaitForFiles(uint64_t files, std::chrono::steady_clock::tim
     auto boostDeadline = boost::chrono::steady_clock::now() +
                          boost::chrono::milliseconds(std::max<int64_t>(0, left.count()));
     boost::unique_lock<boost::mutex> lock(mutex_);
-    while (filesDone_ < files && !threadEnded_ && !stop_) {
-        if (progress_.wait_until(lock, boostDeadline) == boost::cv_status::timeout) break;
-    }
+    progress_.wait_until(lock, boostDeadline,
+                         [&] { return filesDone_ >= files || threadEnded_ || stop_; });
     return filesDone_ >= files;
 }
 
@@ -266,9 +265,8 @@ bool DataController::waitAuthenticationInfo() {
     Logger::Put(11, kFile, fn, __LINE__, "waitAuthInfo.");
     boost::unique_lock<boost::mutex> lock(mutex_);
     auto deadline = deadlineAfterMs(settings_.authRetryTime);
-    while (!stop_ && !credentialsReceived_) {
-        if (credentialsCondition_.wait_until(lock, deadline) == boost::cv_status::timeout) break;
-    }
+    credentialsCondition_.wait_until(lock, deadline,
+                                     [this] { return stop_ || credentialsReceived_; });
     if (credentialsReceived_) {
         Logger::Put(11, kFile, fn, __LINE__, "Received Authentication Info.");
         return true;
@@ -286,9 +284,7 @@ void DataController::waitForFileDuration() {
     Logger::Put(11, kFile, fn, __LINE__, "wait enter.");
     boost::unique_lock<boost::mutex> lock(mutex_);
     auto deadline = deadlineAfterMs(int64_t{settings_.uploadInterval} * 1000);
-    while (!stop_) {
-        if (fileDurationCondition_.wait_until(lock, deadline) == boost::cv_status::timeout) break;
-    }
+    fileDurationCondition_.wait_until(lock, deadline, [this] { return stop_; });
     Logger::Put(11, kFile, fn, __LINE__, "wait exit.");
 }
 

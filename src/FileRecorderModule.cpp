@@ -149,9 +149,7 @@ void FileRecorderModule::WaitForStart() {
         dataReceived_ = false;
         auto deadline = boost::chrono::steady_clock::now() +
                         boost::chrono::milliseconds(settings_.startIgnoreTime);
-        while (!stopRequested_) {
-            if (condition_.wait_until(lock, deadline) == boost::cv_status::timeout) break;
-        }
+        condition_.wait_until(lock, deadline, [this] { return stopRequested_; });
         if (!stopRequested_) {
             Logger::Put(11, nullptr, nullptr, 0, "ST: start filing");
             filing_ = true;
