@@ -55,7 +55,7 @@ bool Module::WaitForRoom(size_t video, size_t audio, size_t meta,
 }
 
 bool Module::Initialize(std::shared_ptr<void> parameter) {
-    auto keepMarkers = [](std::shared_ptr<StreamData> item) {
+    auto keepMarkers = [](const std::shared_ptr<StreamData>& item) {
         return !item || item->payloadSize != 0;
     };
     for (Lane& lane : lanes_) lane.queue = keepMarkers;

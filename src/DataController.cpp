@@ -40,6 +40,9 @@ DataController::DataController(INotifyObserver* observer, std::shared_ptr<IFileB
     };
 }
 
+// A lock or join that fails here is a broken invariant with nothing sound left to do: the
+// terminate (and its crash report) that an exception leaving a destructor causes is intended.
+// NOLINTNEXTLINE(bugprone-exception-escape)
 DataController::~DataController() {
     if (uploadThread_.joinable() && uploadThread_.get_id() != std::this_thread::get_id()) Stop();
 }

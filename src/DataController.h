@@ -38,7 +38,7 @@ class DataController : public IDataController {
                    std::shared_ptr<ITimeManager> timeManager,
                    std::shared_ptr<IDataUploader> uploader, ModuleSettings settings);
     // Stops the upload thread if the owner did not (a joinable thread must never be destroyed).
-    ~DataController() override;
+    ~DataController() override;  // NOLINT(bugprone-exception-escape): see the definition
 
     void Start() override;
     void Stop() override;

@@ -24,6 +24,9 @@ StreamBuffer::StreamBuffer(INotifyObserver* observer, std::shared_ptr<IFileBuffe
       settings_(std::move(settings)),
       recordingOrigin_(static_cast<uint64_t>(static_cast<int64_t>(settings_.startIgnoreTime))) {}
 
+// A lock or join that fails here is a broken invariant with nothing sound left to do: the
+// terminate (and its crash report) that an exception leaving a destructor causes is intended.
+// NOLINTNEXTLINE(bugprone-exception-escape)
 StreamBuffer::~StreamBuffer() {
     std::lock_guard<std::mutex> lifecycle(lifecycleMutex_);
     if (!filingThread_.joinable()) return;

@@ -58,7 +58,7 @@ class StreamBuffer : public IStreamBuffer {
                  std::shared_ptr<ITimeManager> timeManager,
                  std::shared_ptr<INalAnalyzer> nalAnalyzer, ModuleSettings settings);
     // Joins a filing thread the owner forgot to Stop (quietly), then releases the lists.
-    ~StreamBuffer() override;
+    ~StreamBuffer() override;  // NOLINT(bugprone-exception-escape): see the definition
 
     StreamBuffer(const StreamBuffer&) = delete;
     StreamBuffer& operator=(const StreamBuffer&) = delete;

@@ -187,49 +187,20 @@ void MediaHost::receive(BaseProcess& process) {
     const bool limited = options_.durationSeconds >= 0;
     const auto limitUs = static_cast<int64_t>(options_.durationSeconds * 1e6);
     MediaInput::Packet packet;
-    // A paced input hands over the packets that are due together, right before the pacer
-    // waits: each worker then wakes once per burst rather than once per packet. A burst is
-    // bounded by the pacer's slack and by kMaxBatch, so it fits the module's queues. An
-    // unpaced file goes in bursts of kMaxBatch. A file waits for room in the module's queues
-    // before each burst and so never loses a sample; a stop during that wait discards the
-    // burst as if it had not been read.
     Batch batch;
-    auto flush = [&] {
-        if (live_ || batch.empty() || waitForRoom(process, batch)) {
-            for (const auto& [p, t] : batch) deliver(process, p, t);
-        }
-        batch.clear();
-    };
     struct FlushAtExit {
-        std::function<void()> flush;
-        ~FlushAtExit() { flush(); }
-    } flushAtExit{flush};
+        MediaHost& host;
+        BaseProcess& process;
+        Batch& batch;
+        ~FlushAtExit() { host.flush(process, batch); }
+    } flushAtExit{*this, process, batch};
     while (true) {
         std::string error;
-        MediaInput::Status status = input_->Read(&packet, &error);
-        if (status == MediaInput::Status::kStopped) {
-            endReason_ = "stopped";
-            return;
-        }
-        if (status == MediaInput::Status::kEnd || status == MediaInput::Status::kFailed) {
-            if (!live_) {
-                if (status == MediaInput::Status::kFailed) {
-                    Logger::Put(4, kFile, fn, __LINE__, "reading input \"%s\" failed: %s",
-                                shownInput_.c_str(), error.c_str());
-                    endReason_ = "read error";
-                } else {
-                    endReason_ = "end of file";
-                }
-                return;
-            }
-            if (!reopen(status == MediaInput::Status::kEnd ? std::string("the stream ended")
-                                                           : error)) {
-                endReason_ = "stopped";
-                return;
-            }
+        const MediaInput::Status status = input_->Read(&packet, &error);
+        if (status != MediaInput::Status::kPacket) {
+            if (readingEnds(status, error)) return;
             continue;
         }
-
         SampleClock::Times times;
         if (!clock_.Place(packet.track, packet.hasPts, packet.ptsUs, packet.hasDts, packet.dtsUs,
                           packet.durationUs, &times))
@@ -240,21 +211,59 @@ void MediaHost::receive(BaseProcess& process) {
             endReason_ = "duration reached";
             return;
         }
-        if (live_) {
-            deliver(process, packet, times);  // a live input is not paced and cannot wait
-        } else if (!pacer.Paced()) {
-            batch.emplace_back(packet, times);
-            if (batch.size() >= kMaxBatch) flush();
-        } else {
-            if (!pacer.IsDue(times.dtsUs) || batch.size() >= kMaxBatch) flush();
-            if (!pacer.Pace(times.dtsUs)) {
-                endReason_ = "stopped";
-                return;
-            }
-            batch.emplace_back(packet, times);
+        if (!handOn(process, pacer, batch, packet, times)) {
+            endReason_ = "stopped";
+            return;
         }
         reopenPause_ = kFirstReopenPause;  // the input works again
     }
+}
+
+bool MediaHost::readingEnds(MediaInput::Status status, const std::string& error) {
+    constexpr const char* fn = "MediaHost::receive";
+    if (status == MediaInput::Status::kStopped) {
+        endReason_ = "stopped";
+        return true;
+    }
+    if (!live_) {
+        if (status == MediaInput::Status::kFailed) {
+            Logger::Put(4, kFile, fn, __LINE__, "reading input \"%s\" failed: %s",
+                        shownInput_.c_str(), error.c_str());
+            endReason_ = "read error";
+        } else {
+            endReason_ = "end of file";
+        }
+        return true;
+    }
+    if (!reopen(status == MediaInput::Status::kEnd ? std::string("the stream ended") : error)) {
+        endReason_ = "stopped";
+        return true;
+    }
+    return false;
+}
+
+bool MediaHost::handOn(BaseProcess& process, Pacer& pacer, Batch& batch,
+                       const MediaInput::Packet& packet, const SampleClock::Times& times) {
+    if (live_) {
+        deliver(process, packet, times);  // a live input is not paced and cannot wait
+        return true;
+    }
+    if (!pacer.Paced()) {
+        batch.emplace_back(packet, times);
+        if (batch.size() >= kMaxBatch) flush(process, batch);
+        return true;
+    }
+    if (!pacer.IsDue(times.dtsUs) || batch.size() >= kMaxBatch) flush(process, batch);
+    if (!pacer.Pace(times.dtsUs)) return false;
+    batch.emplace_back(packet, times);
+    return true;
+}
+
+void MediaHost::flush(BaseProcess& process, Batch& batch) {
+    if (live_ || batch.empty() || waitForRoom(process, batch)) {
+        for (const auto& [p, t] : batch) deliver(process, p, t);
+    }
+    batch.clear();
 }
 
 bool MediaHost::waitForRoom(BaseProcess& process, const Batch& batch) {

@@ -45,6 +45,8 @@
 #include "platform/framework/StopSignal.h"
 #include "platform/framework/TokenResponder.h"
 
+class Pacer;
+
 class MediaHost : public IModuleHost {
   public:
     // Pauses before reopening a live input: the first, and the most it grows to.
@@ -77,7 +79,23 @@ class MediaHost : public IModuleHost {
     // Hands credentials to the module; logs why when there are none.
     static void handOver(BaseProcess& process, const credentials::Result& credentials,
                          const char* occasion);
+    // Receive thread, for each read that gave no packet: true (with endReason_ set) when reading
+    // ends; false when a live input was opened again.
+    bool readingEnds(MediaInput::Status status, const std::string& error);
+
+    // A paced input hands over the packets that are due together, right before the pacer
+    // waits: each worker then wakes once per burst rather than once per packet. A burst is
+    // bounded by the pacer's slack and by kMaxBatch, so it fits the module's queues. An
+    // unpaced file goes in bursts of kMaxBatch. A file waits for room in the module's queues
+    // before each burst and so never loses a sample; a stop during that wait discards the
+    // burst as if it had not been read. A live input is handed over packet by packet.
     using Batch = std::vector<std::pair<MediaInput::Packet, SampleClock::Times>>;
+    // Receive thread: delivers the packet or adds it to the burst; false when a stop ended
+    // the pacer's wait.
+    bool handOn(BaseProcess& process, Pacer& pacer, Batch& batch, const MediaInput::Packet& packet,
+                const SampleClock::Times& times);
+    // Receive thread: delivers the burst (after waiting for room, for a file) and empties it.
+    void flush(BaseProcess& process, Batch& batch);
     // A file input: waits until the module can take the whole batch; false when stopped first.
     bool waitForRoom(BaseProcess& process, const Batch& batch);
     void deliver(BaseProcess& process, const MediaInput::Packet& packet,
