@@ -1,6 +1,8 @@
-// Which transfer object the framework's options give, and why none.
+// Which transfer object the framework's options give, and why none. Faults guarded: a file
+// endpoint storing outside its directory or without the key prefix; an unsupported segment
+// format, an unusable file URL, S3 endpoint or key prefix accepted, or refused without a reason;
+// user information of an endpoint in the log.
 #include <gtest/gtest.h>
-#include <stdlib.h>
 #include <sys/stat.h>
 
 #include "platform/framework/FrameworkOptions.h"
@@ -31,8 +33,7 @@ std::string FailureLine(const LogCapture& log) {
 }
 
 TEST(CreateInterfaceTest, FileEndpointStoresUnderTheDirectoryWithThePrefix) {
-    char templ[] = "/tmp/sfr-create-XXXXXX";
-    std::string root = mkdtemp(templ);
+    const std::string root = ScratchDir("create");
     mkdir((root + "/rec").c_str(), 0755);
     LogCapture log;
     auto transfer = Create("file://" + root + "/", "ts", log);
@@ -47,7 +48,6 @@ TEST(CreateInterfaceTest, FileEndpointStoresUnderTheDirectoryWithThePrefix) {
     EXPECT_EQ(Success, transfer->Transfer(request, &info));
     EXPECT_EQ(info.fileSize,
               ReadFile(root + "/rec/pre/cam1/1970/01/01/cam1_19700101T000000.000Z_1.ts").size());
-    RunProcess({"rm", "-rf", root});
 }
 
 TEST(CreateInterfaceTest, ConfigurationsThatCannotWorkGiveNoInterfaceAndSayWhy) {

@@ -1,5 +1,7 @@
-// The local-directory store: whole objects or none, paths that stay inside the bucket (also past
-// symbolic links planted in it), write errors, cancellation.
+// The local-directory store. Faults guarded: a reader seeing a partial object or a temporary
+// file left behind; a key or bucket that leaves the bucket (absolute, "..", ".", empty parts) or
+// follows a symbolic link planted in it; a write error taken for success or leaving a partial
+// file; Cancel not ending a running Put and every later one.
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <stdlib.h>
@@ -18,22 +20,13 @@ using namespace testsupport;
 
 namespace {
 
+const auto Entries = StoreRoot::Entries;
+
 class LocalDirectoryStoreTest : public ::testing::Test {
   protected:
-    ObjectToStore Object(const std::string& key, const std::string& bytes,
-                         const std::string& bucket = "rec") {
-        ObjectToStore object;
-        object.bucket = bucket;
-        object.key = key;
-        object.data = reinterpret_cast<const uint8_t*>(bytes.data());
-        object.size = bytes.size();
-        return object;
-    }
-    FileTransferResult Put(const ObjectToStore& object) {
-        return store_.Put(object, StoreCredentials(), &info_);
-    }
-    static std::vector<std::string> Entries(const std::string& directory) {
-        return StoreRoot::Entries(directory);
+    FileTransferResult Put(const std::string& key, const std::string& bytes,
+                           const std::string& bucket = "rec") {
+        return store_.Put(ObjectFor(bucket, key, bytes), StoreCredentials(), &info_);
     }
 
     StoreRoot dir_;
@@ -60,7 +53,7 @@ TEST_F(LocalDirectoryStoreTest, ReaderSeesTheWholeObjectOrNothing) {
             if (static_cast<size_t>(st.st_size) != bytes.size()) ++partialSightings;
         }
     });
-    FileTransferResult result = Put(Object(key, bytes));
+    FileTransferResult result = Put(key, bytes);
     ASSERT_TRUE(WaitUntil([&] { return sightings > 0; }));
     done = true;
     reader.join();
@@ -72,7 +65,7 @@ TEST_F(LocalDirectoryStoreTest, ReaderSeesTheWholeObjectOrNothing) {
     EXPECT_EQ(std::vector<std::string>{"cam1_20261206T110000.000Z_1.ts"},
               Entries(root_ + "/rec/cam1/2026/12/06"));
     // Storing the same key again replaces the object whole.
-    EXPECT_EQ(Success, Put(Object(key, "second")));
+    EXPECT_EQ(Success, Put(key, "second"));
     EXPECT_EQ("second", ReadFile(path));
 }
 
@@ -93,21 +86,21 @@ TEST_F(LocalDirectoryStoreTest, PathsOutsideAnExistingBucketAreFilePathErrors) {
         {"rec", "cam1/"},
     };
     for (const auto& [bucket, key] : refused)
-        EXPECT_EQ(FilePathError, Put(Object(key, "x", bucket))) << bucket << " " << key;
+        EXPECT_EQ(FilePathError, Put(key, "x", bucket)) << bucket << " " << key;
     // Directories of the key that are symbolic links, to the outside or inside the bucket.
     StoreRoot outside;
     ASSERT_EQ(0, symlink(outside.Root().c_str(), (root_ + "/rec/out").c_str()));
     ASSERT_EQ(0, symlink(".", (root_ + "/rec/in").c_str()));
     for (const char* key : {"out/a.ts", "out/rec/a.ts", "in/a.ts"})
-        EXPECT_EQ(FilePathError, Put(Object(key, "x"))) << key;
+        EXPECT_EQ(FilePathError, Put(key, "x")) << key;
     EXPECT_EQ(std::vector<std::string>{"rec"}, Entries(outside.Root()));
     unlink((root_ + "/rec/out").c_str());
     unlink((root_ + "/rec/in").c_str());
     LocalDirectoryStore noRoot(root_ + "/nowhere");
-    EXPECT_EQ(FilePathError, noRoot.Put(Object("a.ts", "x"), StoreCredentials(), &info_));
+    EXPECT_EQ(FilePathError, noRoot.Put(ObjectFor("rec", "a.ts", "x"), StoreCredentials(), &info_));
     // A key part that is a file where a directory must be.
-    ASSERT_EQ(Success, Put(Object("cam1", "x")));
-    EXPECT_EQ(FilePathError, Put(Object("cam1/a.ts", "x")));
+    ASSERT_EQ(Success, Put("cam1", "x"));
+    EXPECT_EQ(FilePathError, Put("cam1/a.ts", "x"));
     EXPECT_EQ(Entries(root_), std::vector<std::string>{"rec"});
     EXPECT_EQ(Entries(root_ + "/rec"), std::vector<std::string>{"cam1"});
 }
@@ -124,7 +117,7 @@ TEST_F(LocalDirectoryStoreTest, WriteErrorIsAnInternalErrorAndLeavesNothing) {
     struct rlimit limit = saved;
     limit.rlim_cur = 1 << 20;
     ASSERT_EQ(0, setrlimit(RLIMIT_FSIZE, &limit));
-    FileTransferResult result = Put(Object("cam1/a.ts", big));
+    FileTransferResult result = Put("cam1/a.ts", big);
     setrlimit(RLIMIT_FSIZE, &saved);
     sigaction(SIGXFSZ, &previous, nullptr);
     EXPECT_EQ(InternalError, result);
@@ -140,7 +133,7 @@ TEST_F(LocalDirectoryStoreTest, CancelEndsARunningPutAndEveryLaterOne) {
     FileTransferResult running = Success;
     std::thread writer([&] {
         started = true;
-        running = store_.Put(Object("cam1/big.ts", big), StoreCredentials(), &info_);
+        running = Put("cam1/big.ts", big);
     });
     ASSERT_TRUE(WaitUntil([&] { return started.load(); }));
     store_.Cancel();
@@ -148,7 +141,7 @@ TEST_F(LocalDirectoryStoreTest, CancelEndsARunningPutAndEveryLaterOne) {
     EXPECT_TRUE(running == TimeOut || running == Success);
     for (const std::string& name : Entries(root_ + "/rec/cam1")) EXPECT_EQ("big.ts", name);
 
-    EXPECT_EQ(TimeOut, Put(Object("cam1/later.ts", "x")));
+    EXPECT_EQ(TimeOut, Put("cam1/later.ts", "x"));
     EXPECT_EQ(0u, info_.fileSize);
     EXPECT_NE(0, access((root_ + "/rec/cam1/later.ts").c_str(), F_OK));
 }

@@ -1,6 +1,8 @@
-// Pacing after failures: the waits before retries and between failed transfers, and that a
-// store that keeps refusing (s3rver with a wrong secret, a missing local bucket, a server that
-// answers 503) is tried a bounded number of times however often the recorder asks again.
+// Pacing after failures. Faults guarded: retry waits outside their jittered, capped bounds; a
+// floor between failed transfers that does not double to its cap or is not reset by a success;
+// a store that keeps refusing (s3rver with a wrong secret, a missing local bucket, a server that
+// answers 503) tried without bound when the recorder asks again at once; Cancel not ending the
+// wait after a failure.
 #include <gtest/gtest.h>
 
 #include <atomic>
@@ -67,7 +69,7 @@ FileTransferRequest OneSample(const std::string& bucket, const std::string& secr
 // 0.2, 0.6, 1.4 and 3.0 s; each tries at most three times when the failure may pass.
 TEST(RetryPacingTest, AStoreThatKeepsRefusingIsTriedABoundedNumberOfTimes) {
     S3rver s3rver;
-    ASSERT_TRUE(s3rver.Start(std::string(SFR_SOURCE_DIR) + "/scripts/s3rver.sh", BuildPath("node")))
+    ASSERT_TRUE(s3rver.Start(SFR_SOURCE_DIR "/scripts/s3rver.sh", BuildPath("node")))
         << s3rver.Error();
     ScriptedHttpServer busy(ScriptedHttpServer::Mode::kRespond,
                             S3ErrorAnswer("503 Slow Down", "SlowDown"));
@@ -118,11 +120,7 @@ TEST(RetryPacingConcurrencyTest, CancelEndsTheWaitAfterAFailure) {
     LogCapture log;
     std::atomic<int> result{-1};
     std::thread upload([&] { result = transfer.Transfer(request, nullptr); });
-    const bool waiting = WaitUntil([&] {
-        for (const std::string& m : log.Messages())
-            if (m.find("waits") != std::string::npos) return true;
-        return false;
-    });
+    const bool waiting = WaitUntil([&] { return log.CountContaining("waits") > 0; });
     const auto cancelled = steady_clock::now();
     transfer.Cancel();
     upload.join();
