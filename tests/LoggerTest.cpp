@@ -1,3 +1,7 @@
+// The logger. Faults guarded: a line without its priority, location or text, or a line of a
+// priority beyond the level written; a capture missing a line or cutting a long one; a line split
+// by a value's control characters; a storm of one repeated warning; a log file opened through a
+// planted link or created readable by others; lines lost between concurrent writers.
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -10,10 +14,7 @@
 
 TEST(LoggerFormat, LineCarriesPriorityLocationAndTextAndCaptureSeesEveryLineWhole) {
     LogCapture log;
-    char path[] = "/tmp/sfr-log-XXXXXX";
-    int fd = mkstemp(path);
-    ASSERT_GE(fd, 0);
-    close(fd);
+    const std::string path = testsupport::ScratchDir("logformat") + "/log.txt";
     ASSERT_TRUE(Logger::SetFile(path));
     Logger::Put(11, "src/StreamBuffer", "Orvane::StreamBuffer::Start", 123, "Start %s.", "enter");
     Logger::Put(11, nullptr, nullptr, 0, "ST: V:%zu", size_t{3});
@@ -24,7 +25,6 @@ TEST(LoggerFormat, LineCarriesPriorityLocationAndTextAndCaptureSeesEveryLineWhol
         << text;
     EXPECT_NE(text.find("<11> ST: V:3\n"), std::string::npos);
     EXPECT_EQ(text.find("dropped"), std::string::npos);
-    unlink(path);
 
     std::string longText(5000, 'a');
     Logger::Put(13, nullptr, nullptr, 0, "%s", longText.c_str());
@@ -38,18 +38,14 @@ TEST(LoggerFormat, LineCarriesPriorityLocationAndTextAndCaptureSeesEveryLineWhol
 // What a log file never holds: a line split by a value's control characters, a storm of one
 // repeated warning, or anything written through a planted link.
 TEST(LoggerFormat, ControlCharactersEscapedRepeatedWarningsCondensedLinksNotFollowed) {
-    char dir[] = "/tmp/sfr-logdir-XXXXXX";
-    ASSERT_NE(mkdtemp(dir), nullptr);
-    const std::string path = std::string(dir) + "/log.txt";
+    const std::string dir = testsupport::ScratchDir("logfile");
+    const std::string path = dir + "/log.txt";
     ASSERT_TRUE(Logger::SetFile(path));
     Logger::Put(11, nullptr, nullptr, 0, "stream id %s", "cam\r\n2026-01-01 <4> forged");
     for (int i = 0; i < 1000; ++i) Logger::Put(5, "f", "g", 7, "store refused: %s", "NoSuchBucket");
     std::string text = testsupport::ReadFile(path);
     EXPECT_NE(text.find("stream id cam\\x0d\\x0a2026-01-01 <4> forged\n"), std::string::npos);
-    size_t refusals = 0;
-    for (size_t at = 0; (at = text.find("store refused", at)) != std::string::npos; ++at)
-        ++refusals;
-    EXPECT_EQ(refusals, 1u) << text.substr(0, 2000);
+    EXPECT_EQ(text.find("store refused"), text.rfind("store refused")) << text.substr(0, 2000);
     struct stat st {};
     ASSERT_EQ(stat(path.c_str(), &st), 0);
     EXPECT_EQ(
@@ -59,12 +55,9 @@ TEST(LoggerFormat, ControlCharactersEscapedRepeatedWarningsCondensedLinksNotFoll
             return mask;
         }());
 
-    const std::string link = std::string(dir) + "/link.txt";
+    const std::string link = dir + "/link.txt";
     ASSERT_EQ(symlink(path.c_str(), link.c_str()), 0);
     EXPECT_FALSE(Logger::SetFile(link));
-    unlink(link.c_str());
-    unlink(path.c_str());
-    rmdir(dir);
 }
 
 TEST(LoggerConcurrency, ConcurrentWritersLoseNoLine) {

@@ -7,7 +7,6 @@
 //   recurse                        unbounded recursion on the main thread
 //   throw                          an exception nobody catches
 //   abort                          abort()
-//   wait                           blocks until a signal ends it (for kill tests)
 //   fault-in-report-same           SIGSEGV, and another SIGSEGV while the report is written
 //   fault-in-report-other          SIGFPE, and a SIGSEGV while the report is written
 //   hang-in-report                 SIGSEGV whose report never finishes (1 s deadline)
@@ -209,10 +208,6 @@ int main(int argc, char** argv) {
     if (mode == "recurse") sink = RecurseForever(0);
     if (mode == "throw") ThrowUnhandled();
     if (mode == "abort") std::abort();
-    if (mode == "wait") {
-        printLine("waiting\n");
-        while (true) pause();
-    }
 #ifdef SFR_WITH_REPORTER
     if (mode == "fault-in-report-same") {
         Tracewright::SetReportHook(faultInsideReport);
