@@ -4,9 +4,11 @@
 // stopped on a module error, 3 when every stream file was given up and none stored. --help and
 // --version print to stdout and exit 0 without starting anything.
 #include <cstdio>
+#include <memory>
 #include <string>
 
 #include "platform/logger/Logger.h"
+#include "platform/playback/PlaylistWriter.h"
 #include "src/ProcessControl.h"
 
 namespace {
@@ -36,6 +38,10 @@ int main(int argc, char** argv) {
     {
         Orvane::ProcessControl process(argc, argv);
         Logger::Put(6, nullptr, "main", 0, "VQ-VERSION:%s", kVersion);
+        // Declared after `process`, so it unsubscribes before the process goes.
+        std::unique_ptr<PlaylistWriter> playlists;
+        if (CurrentFrameworkOptions().playlist)
+            playlists = PlaylistWriter::Subscribed(CurrentFrameworkOptions().keyPrefix);
         if (!process.Initialize()) {
             Logger::Put(11, nullptr, "main", 0, "Initialize Error.");
             Logger::Put(4, nullptr, "main", 0, "%s --help lists the options, with an example",

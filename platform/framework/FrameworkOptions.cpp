@@ -68,6 +68,11 @@ FrameworkOptions FrameworkOptions::Read(const CommandLine& cl, std::vector<std::
                          "\"");
     }
     cl.Find("keyprefix", o.keyPrefix);
+    if (cl.Find("playlist", v)) {
+        if (v != "on" && v != "off")
+            errors.push_back("-playlist needs on or off, got \"" + v + "\"");
+        o.playlist = v != "off";
+    }
     if (cl.Find("loglevel", v) && !CommandLine::ParseInt(v, o.logLevel)) {
         errors.push_back("-loglevel needs a whole number, got \"" + v + "\"");
         o.logLevel = 11;
@@ -98,6 +103,7 @@ std::vector<OptionHelp> FrameworkOptions::Help() {
         {"tagging", "K=V&...", "none", "tags of every object"},
         {"addressing", "auto|path|virtual", "auto", "bucket addressing style"},
         {"segmentformat", "ts", "ts", "object format"},
+        {"playlist", "on|off", "on", "HLS playlists beside the objects (live.m3u8, hourly)"},
         {"readrate", "R", "1 for files", "pace a file at R times real time; 0 reads at once"},
         {"duration", "S", "none", "end after S seconds of input"},
         {"draintimeout", "S", "30", "at the end, store what is held for at most S seconds"},

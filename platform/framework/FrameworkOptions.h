@@ -26,6 +26,7 @@ struct FrameworkOptions {
     std::string credentialProcess;     // -credentialprocess
     std::string segmentFormat = "ts";  // -segmentformat
     std::string keyPrefix;             // -keyprefix
+    bool playlist = true;              // -playlist on|off: HLS playlists beside the objects
     int logLevel = 11;                 // -loglevel
     std::string logFile;               // -logfile, empty: stderr
     std::string statusPath = "-";      // -status, "-": stdout

@@ -21,6 +21,7 @@
 #include <utility>
 
 #include "platform/transfer/FileTransfer.h"
+#include "platform/transfer/ObjectStore.h"
 #include "platform/transfer/SegmentFormat.h"
 
 // One stream file's object, as the transfer stored it (or tried to).
@@ -35,6 +36,20 @@ struct StoredObject {
     uint64_t size = 0;            // bytes stored; 0 unless result is Success
     uint32_t responseTimeMs = 0;  // the store's response time
     FileTransferResult result = Success;
+    // The transfer object (one connection's run) that wrote it, unique in the process: objects
+    // of two runs are never continuous (each run has its own timeline).
+    uint64_t runId = 0;
+    // Its first video sample comes from another opening of the input than the last video sample
+    // of the run's object before: the pictures (and maybe the codec's parameters) start afresh.
+    bool newInput = false;
+    // The key of the init segment the object needs to play (the format's header, stored once
+    // per run before the first object that needs it); "" for formats without one (TS).
+    std::string initKey;
+    // The store that took the object and the credentials of its Put, so that a subscriber can
+    // store objects of its own beside it (playlists) the same way. Valid during the call only;
+    // null for events that did not come from a transfer. Credentials are never to be logged.
+    IObjectStore* store = nullptr;
+    const StoreCredentials* credentials = nullptr;
 };
 
 class ObjectEvents {

@@ -1,5 +1,6 @@
 #include "platform/transfer/SegmentTransfer.h"
 
+#include <atomic>
 #include <cinttypes>
 
 #include "platform/logger/Logger.h"
@@ -8,6 +9,16 @@
 namespace {
 constexpr const char* kFile = "platform/transfer/SegmentTransfer";
 constexpr const char* kFunction = "SegmentTransfer::Transfer";
+
+uint64_t nextRunId() {
+    static std::atomic<uint64_t> last{0};
+    return ++last;
+}
+
+const std::shared_ptr<const TrackDescription>* trackOf(const StreamData& sample) {
+    return sample.source ? &sample.source->Track() : nullptr;
+}
+
 }  // namespace
 
 SegmentTransfer::SegmentTransfer(std::shared_ptr<IObjectStore> store, std::string keyPrefix,
@@ -16,7 +27,8 @@ SegmentTransfer::SegmentTransfer(std::shared_ptr<IObjectStore> store, std::strin
       keyPrefix_(std::move(keyPrefix)),
       format_(format),
       writer_(format),
-      floor_(pacing) {}
+      floor_(pacing),
+      runId_(nextRunId()) {}
 
 void SegmentTransfer::Cancel() {
     cancel_.Raise();
@@ -57,16 +69,32 @@ FileTransferResult SegmentTransfer::Transfer(const FileTransferRequest& request,
     event.captureMicros = FirstCaptureTime(request);
     event.key = ObjectKey(keyPrefix_, request.streamingId, request.sequenceNumber,
                           event.captureMicros, format_.extension);
-    event.result = writeAndStore(request, event, info);
+    event.runId = runId_;
+    if (!request.video.empty()) {
+        const auto* first = trackOf(request.video.front());
+        event.newInput = lastVideoTrack_ && first && *first != lastVideoTrack_;
+    }
+    StoreCredentials credentials;
+    credentials.accessKey = request.accessKey;
+    credentials.secretKey = request.secretKey;
+    credentials.sessionToken = request.sessionToken;
+    credentials.region = request.region;
+    credentials.accelerate = request.s3Accel;
+    event.result = writeAndStore(request, event, credentials, info);
     floor_.Record(event.result == Success, std::chrono::steady_clock::now());
+    if (event.result == Success && !request.video.empty())
+        if (const auto* last = trackOf(request.video.back())) lastVideoTrack_ = *last;
     event.size = info->fileSize;
     event.responseTimeMs = info->responseTime;
+    event.store = store_.get();
+    event.credentials = &credentials;
     ObjectEvents::Publish(event);
     return event.result;
 }
 
 FileTransferResult SegmentTransfer::writeAndStore(const FileTransferRequest& request,
                                                   const StoredObject& event,
+                                                  const StoreCredentials& credentials,
                                                   FileTransferInfo* info) {
     SegmentWriter::Report report;
     std::string error;
@@ -92,13 +120,6 @@ FileTransferResult SegmentTransfer::writeAndStore(const FileTransferRequest& req
                                      event.captureMicros);
     object.data = object_.data();
     object.size = object_.size();
-
-    StoreCredentials credentials;
-    credentials.accessKey = request.accessKey;
-    credentials.secretKey = request.secretKey;
-    credentials.sessionToken = request.sessionToken;
-    credentials.region = request.region;
-    credentials.accelerate = request.s3Accel;
 
     FileTransferResult result = store_->Put(object, credentials, info);
     Logger::Put(13, kFile, kFunction, __LINE__, "%s/%s: %zu bytes, result %x",

@@ -5,6 +5,10 @@
 // ObjectEvents event. One object serves one connection of the recorder: the writer's timeline
 // offset is fixed by its first object, so the objects of one connection are continuous.
 //
+// Each published event names the store and the credentials of the Put (valid during the call),
+// the run (a process-wide number of this transfer object), and whether the object's video comes
+// from a new opening of the input.
+//
 // After a failed transfer the next one waits for the failure floor of RetryPolicy (a delay that
 // doubles with each failure in a row and ends at once on Cancel), so that a store that keeps
 // refusing, or a stream file the writer cannot take, is not tried in a tight loop.
@@ -23,6 +27,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/framework/ReceivedSample.h"
 #include "platform/transfer/FileTransfer.h"
 #include "platform/transfer/ObjectEvents.h"
 #include "platform/transfer/ObjectStore.h"
@@ -44,7 +49,7 @@ class SegmentTransfer : public IFileTransfer {
   private:
     // Writes the object and stores it; fills event.size/responseTimeMs through `info`.
     FileTransferResult writeAndStore(const FileTransferRequest& request, const StoredObject& event,
-                                     FileTransferInfo* info);
+                                     const StoreCredentials& credentials, FileTransferInfo* info);
 
     const std::shared_ptr<IObjectStore> store_;
     const std::string keyPrefix_;
@@ -52,5 +57,9 @@ class SegmentTransfer : public IFileTransfer {
     SegmentWriter writer_;         // used by Transfer only
     std::vector<uint8_t> object_;  // the last object written; its capacity is reused
     FailureFloor floor_;           // used by Transfer only
-    CancelSignal cancel_;          // raised by Cancel
+    const uint64_t runId_;         // StoredObject::runId of this object's events
+    // The track of the last video sample of the last object written: a first video sample of
+    // another track means the input was opened again (StoredObject::newInput).
+    std::shared_ptr<const TrackDescription> lastVideoTrack_;
+    CancelSignal cancel_;  // raised by Cancel
 };
