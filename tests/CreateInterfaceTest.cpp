@@ -53,7 +53,7 @@ TEST(CreateInterfaceTest, FileEndpointStoresUnderTheDirectoryWithThePrefix) {
 TEST(CreateInterfaceTest, ConfigurationsThatCannotWorkGiveNoInterfaceAndSayWhy) {
     LogCapture log;
     EXPECT_FALSE(Create("file:///tmp", "mp4", log));
-    EXPECT_EQ("segment format \"mp4\" is not supported (only \"ts\")", FailureLine(log));
+    EXPECT_EQ("segment format \"mp4\" is not supported (only \"ts\", \"fmp4\")", FailureLine(log));
 
     for (const char* endpoint :
          {"file://relative/dir", "file:relative", "file:///tmp?x=1", "file:///bad%zz", "file://"}) {

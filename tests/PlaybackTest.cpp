@@ -1,6 +1,7 @@
 // Recordings played back through their playlists by the ffmpeg CLI, as a viewer would: the
 // frames that come out of live.m3u8 and of the hour's playlist are exactly the stored objects'
-// frames, and an input that was opened again shows as a discontinuity.
+// frames (MPEG-TS and fragmented MP4), and an input that was opened again shows as a
+// discontinuity.
 #include <arpa/inet.h>
 #include <gtest/gtest.h>
 #include <netinet/in.h>
@@ -127,30 +128,41 @@ int FreeUdpPort() {
     return ntohs(address.sin_port);
 }
 
+// Each object format: the run's objects (behind the run's one init segment for fragmented MP4)
+// decode to the same frames as the playlists.
 TEST(PlaybackTest, RecordedRunPlaysThroughItsPlaylists) {
     const std::string clip = Clip(5);
     ASSERT_FALSE(clip.empty());
-    const std::string dir = Scratch("ts");
-    auto r = RunProcess(Recorder(clip, dir, Words("-readrate 5")), 120000);
-    ASSERT_EQ(r.exitStatus, 0) << r.output << ReadFile(dir + "/log.txt");
+    for (const std::string format : {"ts", "fmp4"}) {
+        SCOPED_TRACE(format);
+        const std::string dir = Scratch(format);
+        auto r = RunProcess(Recorder(clip, dir, Args{"-readrate", "5", "-segmentformat", format}),
+                            120000);
+        ASSERT_EQ(r.exitStatus, 0) << r.output << ReadFile(dir + "/log.txt");
 
-    const auto objects = Stored(dir, "\\.ts");
-    ASSERT_GE(objects.size(), 3u);
-    const std::string live = dir + "/store/rec/cam1/live.m3u8";
-    const std::string text = ReadFile(live);
-    EXPECT_EQ(Count(text, "#EXTINF:"), objects.size()) << text;
-    EXPECT_EQ(Count(text, "#EXT-X-DISCONTINUITY"), 0u) << text;
-    EXPECT_EQ(Count(text, "#EXT-X-PROGRAM-DATE-TIME:"), objects.size()) << text;
+        const auto objects = Stored(dir, format == "ts" ? "\\.ts" : "\\.m4s");
+        const auto inits = Stored(dir, "_init\\.mp4");
+        ASSERT_GE(objects.size(), 3u);
+        ASSERT_EQ(inits.size(), format == "ts" ? 0u : 1u);
+        const std::string live = dir + "/store/rec/cam1/live.m3u8";
+        const std::string text = ReadFile(live);
+        EXPECT_EQ(Count(text, "#EXTINF:"), objects.size()) << text;
+        EXPECT_EQ(Count(text, "#EXT-X-DISCONTINUITY"), 0u) << text;
+        EXPECT_EQ(Count(text, "#EXT-X-PROGRAM-DATE-TIME:"), objects.size()) << text;
+        EXPECT_EQ(Count(text, "#EXT-X-MAP:URI="), inits.size()) << text;
 
-    const auto stored = FrameHashes(Concatenate(objects, dir + "/all.ts"));
-    ASSERT_GT(stored.size(), 60u);
-    EXPECT_EQ(FrameHashes(live), stored);
-    std::vector<std::string> hours;
-    for (const auto& hour : HourPlaylists(dir)) {
-        const auto frames = FrameHashes(hour);
-        hours.insert(hours.end(), frames.begin(), frames.end());
+        std::vector<std::string> files = inits;
+        files.insert(files.end(), objects.begin(), objects.end());
+        const auto stored = FrameHashes(Concatenate(files, dir + "/all." + format));
+        ASSERT_GT(stored.size(), 60u);
+        EXPECT_EQ(FrameHashes(live), stored);
+        std::vector<std::string> hours;
+        for (const auto& hour : HourPlaylists(dir)) {
+            const auto frames = FrameHashes(hour);
+            hours.insert(hours.end(), frames.begin(), frames.end());
+        }
+        EXPECT_EQ(hours, stored);
     }
-    EXPECT_EQ(hours, stored);
 }
 
 TEST(PlaybackTest, InputOpenedAgainIsADiscontinuity) {

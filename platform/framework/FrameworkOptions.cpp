@@ -63,9 +63,8 @@ FrameworkOptions FrameworkOptions::Read(const CommandLine& cl, std::vector<std::
     if (cl.Find("region", o.region)) o.regionSource = "-region";
     cl.Find("credentialprocess", o.credentialProcess);
     cl.Find("segmentformat", o.segmentFormat);
-    if (o.segmentFormat != "ts") {
-        errors.push_back("-segmentformat: only \"ts\" is supported, got \"" + o.segmentFormat +
-                         "\"");
+    if (o.segmentFormat != "ts" && o.segmentFormat != "fmp4") {
+        errors.push_back("-segmentformat needs ts or fmp4, got \"" + o.segmentFormat + "\"");
     }
     cl.Find("keyprefix", o.keyPrefix);
     if (cl.Find("playlist", v)) {
@@ -102,7 +101,8 @@ std::vector<OptionHelp> FrameworkOptions::Help() {
         {"acl", "ACL", "none", "canned ACL, e.g. bucket-owner-full-control"},
         {"tagging", "K=V&...", "none", "tags of every object"},
         {"addressing", "auto|path|virtual", "auto", "bucket addressing style"},
-        {"segmentformat", "ts", "ts", "object format"},
+        {"segmentformat", "ts|fmp4", "ts",
+         "object format: MPEG-TS, or fragmented MP4 (CMAF) with an init segment per run"},
         {"playlist", "on|off", "on", "HLS playlists beside the objects (live.m3u8, hourly)"},
         {"readrate", "R", "1 for files", "pace a file at R times real time; 0 reads at once"},
         {"duration", "S", "none", "end after S seconds of input"},

@@ -1,5 +1,6 @@
 #include "platform/transfer/SegmentTransfer.h"
 
+#include <algorithm>
 #include <atomic>
 #include <cinttypes>
 
@@ -81,6 +82,7 @@ FileTransferResult SegmentTransfer::Transfer(const FileTransferRequest& request,
     credentials.region = request.region;
     credentials.accelerate = request.s3Accel;
     event.result = writeAndStore(request, event, credentials, info);
+    event.initKey = initKey_;
     floor_.Record(event.result == Success, std::chrono::steady_clock::now());
     if (event.result == Success && !request.video.empty())
         if (const auto* last = trackOf(request.video.back())) lastVideoTrack_ = *last;
@@ -120,10 +122,48 @@ FileTransferResult SegmentTransfer::writeAndStore(const FileTransferRequest& req
                                      event.captureMicros);
     object.data = object_.data();
     object.size = object_.size();
+    if (!format_.initExtension.empty()) {
+        const size_t media = SegmentFormat::FirstFragment(object_.data(), object_.size());
+        if (media == 0) {
+            Logger::Put(5, kFile, kFunction, __LINE__,
+                        "stream file %" PRId64 " of %s: the %s object holds no fragment",
+                        request.sequenceNumber, request.streamingId.c_str(), format_.title.c_str());
+            return FileBroken;
+        }
+        const FileTransferResult stored = storeInit(request, event, media, credentials, info);
+        if (stored != Success) return stored;
+        object.data += media;
+        object.size -= media;
+    }
 
     FileTransferResult result = store_->Put(object, credentials, info);
     Logger::Put(13, kFile, kFunction, __LINE__, "%s/%s: %zu bytes, result %x",
                 object.bucket.c_str(), object.key.c_str(), object.size,
                 static_cast<unsigned>(result));
     return result;
+}
+
+FileTransferResult SegmentTransfer::storeInit(const FileTransferRequest& request,
+                                              const StoredObject& event, size_t headerBytes,
+                                              const StoreCredentials& credentials,
+                                              FileTransferInfo* info) {
+    if (!initKey_.empty() && init_.size() == headerBytes &&
+        std::equal(init_.begin(), init_.end(), object_.begin()))
+        return Success;
+    ObjectToStore init;
+    init.bucket = event.bucket;
+    init.key = ObjectKey(keyPrefix_, request.streamingId, request.sequenceNumber,
+                         event.captureMicros, format_.initExtension);
+    init.contentType = format_.initContentType;
+    init.metadata =
+        ObjectMetadata(request.streamingId, request.sequenceNumber, 0, event.captureMicros);
+    init.data = object_.data();
+    init.size = headerBytes;
+    const FileTransferResult result = store_->Put(init, credentials, info);
+    Logger::Put(13, kFile, "SegmentTransfer::storeInit", __LINE__, "%s/%s: %zu bytes, result %x",
+                init.bucket.c_str(), init.key.c_str(), init.size, static_cast<unsigned>(result));
+    if (result != Success) return result;
+    init_.assign(object_.begin(), object_.begin() + static_cast<std::ptrdiff_t>(headerBytes));
+    initKey_ = init.key;
+    return Success;
 }

@@ -5,6 +5,11 @@
 // ObjectEvents event. One object serves one connection of the recorder: the writer's timeline
 // offset is fixed by its first object, so the objects of one connection are continuous.
 //
+// A format whose objects need a header (fragmented MP4) has it cut off each object and stored
+// under its own key (ObjectKey with the format's init ending) before the first object that
+// needs it, and again whenever it changes (another set of tracks, new codec parameters); a
+// failure to store it is the object's result. Events name it (StoredObject::initKey).
+//
 // Each published event names the store and the credentials of the Put (valid during the call),
 // the run (a process-wide number of this transfer object), and whether the object's video comes
 // from a new opening of the input.
@@ -53,6 +58,12 @@ class SegmentTransfer : public IFileTransfer {
 
     const std::shared_ptr<IObjectStore> store_;
     const std::string keyPrefix_;
+    // For a format with an init segment: stores the first `headerBytes` of object_ as the run's
+    // init segment unless the last one stored is the same.
+    FileTransferResult storeInit(const FileTransferRequest& request, const StoredObject& event,
+                                 size_t headerBytes, const StoreCredentials& credentials,
+                                 FileTransferInfo* info);
+
     const SegmentFormat& format_;  // a process-wide constant
     SegmentWriter writer_;         // used by Transfer only
     std::vector<uint8_t> object_;  // the last object written; its capacity is reused
@@ -61,5 +72,7 @@ class SegmentTransfer : public IFileTransfer {
     // The track of the last video sample of the last object written: a first video sample of
     // another track means the input was opened again (StoredObject::newInput).
     std::shared_ptr<const TrackDescription> lastVideoTrack_;
-    CancelSignal cancel_;  // raised by Cancel
+    std::vector<uint8_t> init_;  // the init segment stored last (formats that have one)
+    std::string initKey_;        // its key; "" before one was stored
+    CancelSignal cancel_;        // raised by Cancel
 };

@@ -72,7 +72,16 @@ struct Track {
     size_t next = 0;         // index of the next sample to consider
     bool hasLast = false;    // a sample of this track is in the object
     int64_t lastDts90k = 0;  // decode time of that sample, offset applied
+    bool cutAdts = false;    // AAC samples lose their ADTS header on the way into the muxer
 };
+
+// Bytes of the ADTS header that begins `data` (7, or 9 with a CRC); 0 when there is none or
+// nothing would follow it.
+size_t adtsHeaderBytes(const uint8_t* data, size_t size) {
+    if (!data || size < 7 || data[0] != 0xff || (data[1] & 0xf6) != 0xf0) return 0;
+    const size_t header = (data[1] & 0x01) ? 7 : 9;
+    return size > header ? header : 0;
+}
 
 // The times of one sample in 90 kHz ticks without the run's offset; false when the sample has
 // no usable clock or times.
@@ -174,9 +183,10 @@ class ObjectMuxer {
                     track.description = sample.source->Track().get();
             }
         }
-        int rc = avformat_alloc_output_context2(&muxer_.context, nullptr, "mpegts", nullptr);
+        int rc = avformat_alloc_output_context2(&muxer_.context, nullptr, format_.muxer.c_str(),
+                                                nullptr);
         if (rc < 0 || !muxer_.context)
-            return fail("cannot create the mpegts muxer: " + avError(rc));
+            return fail("cannot create the " + format_.muxer + " muxer: " + avError(rc));
         auto* ioBuffer = static_cast<unsigned char*>(av_malloc(kAvioBufferSize));
         if (!ioBuffer) return fail("out of memory");
         muxer_.io = avio_alloc_context(ioBuffer, kAvioBufferSize, 1, out_, nullptr, appendToBuffer,
@@ -205,9 +215,19 @@ class ObjectMuxer {
     }
 
     // One stream per list that has samples. Audio the object cannot carry is left out and
-    // counted; the first such refusal of the run is logged (`*refusalLogged` remembers it).
-    bool AddStreams(bool* refusalLogged) {
+    // counted; the first such refusal of the run is logged (`*refusalLogged` remembers it). Meta
+    // samples of a format without a data track are left out (logged once: `*metaLogged`).
+    bool AddStreams(bool* refusalLogged, bool* metaLogged) {
         for (Track& track : tracks_) {
+            if (track.kind == TrackDescription::Kind::Meta && !format_.carriesMeta) {
+                if (!track.samples->empty() && !*metaLogged) {
+                    Logger::Put(5, kFile, kFunction, __LINE__,
+                                "metadata is left out of the objects: %s has no data track",
+                                format_.title.c_str());
+                    *metaLogged = true;
+                }
+                continue;
+            }
             if (!track.samples->empty() && !addStream(track, refusalLogged)) return false;
         }
         if (muxer_.context->nb_streams == 0) return fail("no track can be written");
@@ -238,7 +258,10 @@ class ObjectMuxer {
 
     // Header, every usable sample merged by decode time with `offset90k` added, trailer.
     bool WriteAll(int64_t offset90k) {
-        int rc = avformat_write_header(muxer_.context, nullptr);
+        AVDictionary* options = nullptr;
+        int rc = av_dict_parse_string(&options, format_.muxerOptions.c_str(), "=", ":", 0);
+        if (rc >= 0) rc = avformat_write_header(muxer_.context, &options);
+        av_dict_free(&options);
         if (rc < 0) return fail("cannot start the " + format_.title + " object: " + avError(rc));
         int64_t pts = 0, dts = 0;
         while (Track* track = nextSample(offset90k, &pts, &dts)) {
@@ -283,6 +306,35 @@ class ObjectMuxer {
             return fail("out of memory");
         stream->time_base = AVRational{1, static_cast<int>(kTicksPerSecond)};
         track.stream = stream;
+        if (track.codec == AV_CODEC_ID_AAC && !format_.aacInAdts &&
+            stream->codecpar->extradata_size == 0)
+            return rawAac(track);
+        return true;
+    }
+
+    // AAC in ADTS (as TS inputs give it) for a format that wants it raw: the AudioSpecificConfig
+    // from the first sample's ADTS header becomes the stream's extradata, and every sample's
+    // header is skipped as it is written (writeSample).
+    bool rawAac(Track& track) {
+        const StreamData* first = nullptr;
+        for (const StreamData& sample : *track.samples) {
+            if (adtsHeaderBytes(sample.PayloadData(), sample.PayloadBytes()) == 0) continue;
+            first = &sample;
+            break;
+        }
+        if (!first) return true;  // raw already: nothing to cut
+        const uint8_t* h = first->PayloadData();
+        const unsigned objectType = (h[2] >> 6) + 1;
+        const unsigned frequencyIndex = (h[2] >> 2) & 0x0f;
+        const unsigned channels = ((h[2] & 0x01) << 2) | (h[3] >> 6);
+        AVCodecParameters* parameters = track.stream->codecpar;
+        parameters->extradata = static_cast<uint8_t*>(av_mallocz(2 + AV_INPUT_BUFFER_PADDING_SIZE));
+        if (!parameters->extradata) return fail("out of memory");
+        parameters->extradata[0] = static_cast<uint8_t>((objectType << 3) | (frequencyIndex >> 1));
+        parameters->extradata[1] =
+            static_cast<uint8_t>(((frequencyIndex & 1) << 7) | (channels << 3));
+        parameters->extradata_size = 2;
+        track.cutAdts = true;
         return true;
     }
 
@@ -335,10 +387,11 @@ class ObjectMuxer {
 
         // Not reference counted: av_write_frame reads the bytes during the call and keeps no
         // reference, so the sample's own buffer is used as it is.
+        const size_t skip = track.cutAdts ? adtsHeaderBytes(data, size) : 0;
         AVPacket* packet = muxer_.packet;
         av_packet_unref(packet);
-        packet->data = const_cast<uint8_t*>(data);
-        packet->size = static_cast<int>(size);
+        packet->data = const_cast<uint8_t*>(data + skip);
+        packet->size = static_cast<int>(size - skip);
         packet->stream_index = track.stream->index;
         const AVRational ticks{1, static_cast<int>(kTicksPerSecond)};
         packet->pts = av_rescale_q(pts, ticks, track.stream->time_base);
@@ -376,7 +429,8 @@ bool SegmentWriter::Write(const std::vector<StreamData>& video,
     out->clear();
 
     ObjectMuxer object(format_, video, audio, meta, out, report, error);
-    if (!object.Open() || !object.AddStreams(&audioRefusalLogged_)) return false;
+    if (!object.Open() || !object.AddStreams(&audioRefusalLogged_, &metaRefusalLogged_))
+        return false;
     // The run's origin: the earliest decode time among the first usable samples of the first
     // object lands on kRunOrigin90k. Later objects reuse the same offset.
     if (!hasOffset_) {

@@ -1,5 +1,7 @@
 // SegmentWriter: turns the samples of one stream file into one object of a segment format
-// (MPEG-TS) in memory.
+// (MPEG-TS, fragmented MP4) in memory. For fragmented MP4 the object begins with the format's
+// header (ftyp, moov), the same for every object of a run with the same tracks; the caller cuts
+// it off (SegmentFormat::FirstFragment). AAC in ADTS goes in raw where the format wants it so.
 //
 // One writer serves one run of a transfer object (one connection): every Write opens a fresh
 // libavformat muxer of its format over a custom AVIOContext that appends to the caller's buffer,
@@ -73,4 +75,5 @@ class SegmentWriter {
     bool hasOffset_ = false;
     int64_t offset90k_ = 0;
     bool audioRefusalLogged_ = false;  // the "audio left out" line is written once per run
+    bool metaRefusalLogged_ = false;   // so is the "metadata left out" line
 };
