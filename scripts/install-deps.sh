@@ -9,7 +9,7 @@ packages=(
   libspdlog-dev libfmt-dev nlohmann-json3-dev
   libunwind-dev libdw-dev libiberty-dev
   libgtest-dev libgmock-dev libbenchmark-dev
-  ffmpeg awscli
+  ffmpeg awscli chromium
 )
 missing=()
 for p in "${packages[@]}"; do
