@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <cstdio>
 
-#include "platform/transfer/ObjectKey.h"
+#include "platform/transfer/UtcTime.h"
 
 std::string MediaPlaylist::Text() const {
     uint32_t longestMs = 0;
