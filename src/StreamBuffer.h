@@ -34,9 +34,11 @@
 #include <cstdint>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <thread>
 #include <vector>
 
+#include "src/CutRule.h"
 #include "src/IFileBuffer.h"
 #include "src/INalAnalyzer.h"
 #include "src/INotifyObserver.h"
@@ -106,16 +108,23 @@ class StreamBuffer : public IStreamBuffer {
     uint64_t fileBoundary() const;
 
     // --- assembly (StreamFileAssembly.cpp) ---
-    // End (exclusive) of the next file, 0 for none. Takes the GOP lock, calls IsIDR under it.
-    uint64_t calculateCutTime();
-    // Cuts the next file at calculateCutTime() into `file` (passed empty).
+    // Cuts the next file by the cut rule (CutRule.h) into `file` (passed empty); leaves it
+    // empty when no cut is due.
     void createStreamFileData(VqStreamFileData& file);
-    // Moves every held sample below `cut` into `file` and sets its duration. Split from the
-    // cut rule so that a caller with a cut time of its own can use it.
+    // Moves every held sample below `cut` into `file` and sets its duration (the last file of
+    // a stream that ends).
     void takeSamplesBelow(VqStreamFileData& file, uint64_t cut);
-    // Moves the samples below `cut` from the front of `list` to `out`, one lock per sample.
-    void takeListBelow(std::mutex& lock, SampleList& list, std::vector<StreamData>& out,
-                       uint64_t cut, const char* doneMessage);
+    // Copies the held timestamps into a CutInput (one list lock at a time), decides under the
+    // GOP lock (IsIDR runs there) with `fixedCut` or, if none, by the rule, moves the video in
+    // the same holding and then the audio and meta. Without `fixedCut` and with no cut due it
+    // returns at once: `file` stays empty and nothing is logged.
+    void assemble(VqStreamFileData& file, std::optional<uint64_t> fixedCut);
+    // Moves the planned video from the front GOPs into `file`; caller holds the GOP lock.
+    void takeVideo(VqStreamFileData& file, const CutPlan& plan);
+    // Moves `count` samples from the front of `list` to `out`, one lock per sample, so the
+    // receive operation waits at most one move.
+    void takeListFront(std::mutex& lock, SampleList& list, std::vector<StreamData>& out,
+                       size_t count);
     void dumpStreamFile(const VqStreamFileData& file);
     // Newest held timestamp over the three lists; false when nothing is held.
     bool newestHeld(uint64_t& newest);
