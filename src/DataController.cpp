@@ -8,6 +8,8 @@
 namespace Orvane {
 namespace {
 constexpr const char* kFile = "src/DataController";
+// Lines of the upload loop carry this name, whichever of its steps writes them.
+constexpr const char* kFileUpload = "Orvane::DataController::fileUpload";
 
 boost::chrono::steady_clock::time_point deadlineAfterMs(int64_t ms) {
     return boost::chrono::steady_clock::now() + boost::chrono::milliseconds(ms);
@@ -102,98 +104,15 @@ std::string DataController::resultName(FileTransferResult result) const {
 }
 
 void DataController::fileUpload() {
-    constexpr const char* fn = "Orvane::DataController::fileUpload";
-    Logger::Put(11, kFile, fn, __LINE__, "fileUpload enter.");
+    Logger::Put(11, kFile, kFileUpload, __LINE__, "fileUpload enter.");
     int32_t sequenceNumber = 1;
     while (!stopped()) {
         FileTransferRequest request = PopStreamFile(sequenceNumber);
         if (stopped()) break;
-        {
-            boost::lock_guard<boost::mutex> lock(mutex_);
-            inHandDuration_ = request.duration;
-        }
-
+        setInHandDuration(request.duration);
         const uint32_t duration = request.duration;
-        bool succeeded = false;
-        std::string errorName;
-        FileTransferInfo info;  // zero: file size 0, response time 0
-        FileTransferResult result = Success;
-        bool attempt = !stopped();
-        while (attempt) {
-            if (uint64_t count = fileBuffer_->GetBufferCount(); count != 0) {
-                Logger::Put(11, nullptr, nullptr, 0, "ST: Buffer Count : %llu",
-                            static_cast<unsigned long long>(count));
-            }
-            bool haveCredentials;
-            {
-                boost::lock_guard<boost::mutex> lock(mutex_);
-                haveCredentials = credentialsReceived_;
-            }
-            result = haveCredentials ? uploader_->Upload(request, &info) : AuthenticationError;
-
-            if (result == Success) {
-                Logger::Put(13, kFile, fn, __LINE__, "FileTransferResult Success.");
-                consecutiveAuthErrors_ = 0;
-                if (observer_ != nullptr && observer_->GetModuleStatus() == Warning) {
-                    observer_->notifyModuleExecute();
-                }
-                succeeded = true;
-                break;
-            }
-            if (result == UploaderDisabled) {
-                Logger::Put(11, nullptr, nullptr, 0, "ST: File Uploader is Disabled.");
-                break;
-            }
-            if (result == OtherError) {
-                Logger::Put(4, kFile, fn, __LINE__, "Other Error.");
-                if (observer_ != nullptr) observer_->notifyModuleError(21);
-                boost::lock_guard<boost::mutex> lock(mutex_);
-                stop_ = true;
-                break;
-            }
-            if (result == AuthenticationError) {
-                Logger::Put(11, nullptr, nullptr, 0, "ST: Authentication Error.");
-                {
-                    boost::lock_guard<boost::mutex> lock(mutex_);
-                    credentialsReceived_ = false;
-                }
-                ++consecutiveAuthErrors_;
-                GetAWSSecureTokenRequest tokenRequest;
-                if (observer_ != nullptr) observer_->notifyGetAWSTokenRequest(tokenRequest);
-                if (waitAuthenticationInfo()) {
-                    boost::lock_guard<boost::mutex> lock(mutex_);
-                    request.accessKey = credentials_.accessKey;
-                    request.secretKey = credentials_.secretKey;
-                    request.sessionToken = credentials_.sessionToken;
-                    request.region = credentials_.region;
-                }
-            } else if (result == NetworkError) {
-                Logger::Put(11, nullptr, nullptr, 0, "ST: Network Error.");
-                waitForFileDuration();
-            }
-            // Every other result is retried at once.
-
-            if (fileBuffer_->IsBufferFull()) {
-                errorName = resultName(result);
-                if (!(errorName == "AuthenticationError" && consecutiveAuthErrors_ < 2) &&
-                    observer_ != nullptr) {
-                    auto code = warningCodes_.find(errorName);
-                    observer_->notifyModuleWarn(
-                        code == warningCodes_.end() ? 0u : static_cast<unsigned>(code->second));
-                }
-                break;
-            }
-            attempt = !stopped();
-        }
-
-        const bool stopNow = stopped();
-        if (!stopNow || succeeded) {
-            notifySequence(sequenceNumber, succeeded, errorName, duration);
-            notifyUploadInfo(sequenceNumber, info, result);
-            ++sequenceNumber;
-            fileDone(true);
-            if (!stopNow) deleteOverFileBuffer(sequenceNumber);
-        }
+        const UploadOutcome outcome = uploadUntilSettled(request);
+        reportFile(sequenceNumber, outcome, duration);
         // `request` (and with it the file's samples) is released here.
     }
     {
@@ -202,7 +121,114 @@ void DataController::fileUpload() {
         inHandDuration_ = 0;
     }
     progress_.notify_all();
-    Logger::Put(11, kFile, fn, __LINE__, "fileUpload exit.");
+    Logger::Put(11, kFile, kFileUpload, __LINE__, "fileUpload exit.");
+}
+
+void DataController::setInHandDuration(uint32_t duration) {
+    boost::lock_guard<boost::mutex> lock(mutex_);
+    inHandDuration_ = duration;
+}
+
+DataController::UploadOutcome DataController::uploadUntilSettled(FileTransferRequest& request) {
+    UploadOutcome outcome;  // zero info: file size 0, response time 0
+    bool attempt = !stopped();
+    while (attempt) {
+        if (uint64_t count = fileBuffer_->GetBufferCount(); count != 0) {
+            Logger::Put(11, nullptr, nullptr, 0, "ST: Buffer Count : %llu",
+                        static_cast<unsigned long long>(count));
+        }
+        bool haveCredentials;
+        {
+            boost::lock_guard<boost::mutex> lock(mutex_);
+            haveCredentials = credentialsReceived_;
+        }
+        outcome.result =
+            haveCredentials ? uploader_->Upload(request, &outcome.info) : AuthenticationError;
+        if (outcome.result == Success) {
+            onUploaded();
+            outcome.succeeded = true;
+            break;
+        }
+        if (!reactToFailure(outcome.result, request)) break;
+        if (fileBuffer_->IsBufferFull()) {
+            outcome.errorName = giveUpOnFullBuffer(outcome.result);
+            break;
+        }
+        attempt = !stopped();
+    }
+    return outcome;
+}
+
+void DataController::onUploaded() {
+    Logger::Put(13, kFile, kFileUpload, __LINE__, "FileTransferResult Success.");
+    consecutiveAuthErrors_ = 0;
+    if (observer_ != nullptr && observer_->GetModuleStatus() == Warning) {
+        observer_->notifyModuleExecute();
+    }
+}
+
+bool DataController::reactToFailure(FileTransferResult result, FileTransferRequest& request) {
+    if (result == UploaderDisabled) {
+        Logger::Put(11, nullptr, nullptr, 0, "ST: File Uploader is Disabled.");
+        return false;
+    }
+    if (result == OtherError) {
+        Logger::Put(4, kFile, kFileUpload, __LINE__, "Other Error.");
+        if (observer_ != nullptr) observer_->notifyModuleError(21);
+        boost::lock_guard<boost::mutex> lock(mutex_);
+        stop_ = true;
+        return false;
+    }
+    if (result == AuthenticationError) {
+        Logger::Put(11, nullptr, nullptr, 0, "ST: Authentication Error.");
+        renewCredentials(request);
+    } else if (result == NetworkError) {
+        Logger::Put(11, nullptr, nullptr, 0, "ST: Network Error.");
+        waitForFileDuration();
+    }
+    // Every other result is retried at once.
+    return true;
+}
+
+void DataController::renewCredentials(FileTransferRequest& request) {
+    {
+        boost::lock_guard<boost::mutex> lock(mutex_);
+        credentialsReceived_ = false;
+    }
+    ++consecutiveAuthErrors_;
+    GetAWSSecureTokenRequest tokenRequest;
+    if (observer_ != nullptr) observer_->notifyGetAWSTokenRequest(tokenRequest);
+    if (waitAuthenticationInfo()) {
+        boost::lock_guard<boost::mutex> lock(mutex_);
+        request.accessKey = credentials_.accessKey;
+        request.secretKey = credentials_.secretKey;
+        request.sessionToken = credentials_.sessionToken;
+        request.region = credentials_.region;
+    }
+}
+
+std::string DataController::giveUpOnFullBuffer(FileTransferResult result) {
+    std::string errorName = resultName(result);
+    // A single authentication error is routine (expired credentials): no warning for it.
+    if (!(errorName == "AuthenticationError" && consecutiveAuthErrors_ < 2) &&
+        observer_ != nullptr) {
+        auto code = warningCodes_.find(errorName);
+        observer_->notifyModuleWarn(
+            code == warningCodes_.end() ? 0u : static_cast<unsigned>(code->second));
+    }
+    return errorName;
+}
+
+void DataController::reportFile(int32_t& sequenceNumber, const UploadOutcome& outcome,
+                                uint32_t duration) {
+    // A file whose upload a stop interrupted is not reported; one that made it is.
+    const bool stopNow = stopped();
+    if (stopNow && !outcome.succeeded) return;
+    notifySequence(sequenceNumber, outcome.succeeded, outcome.errorName, duration);
+    notifyUploadInfo(sequenceNumber, outcome.info, outcome.result);
+    ++sequenceNumber;
+    fileDone(true);
+    if (!stopNow) deleteOverFileBuffer(sequenceNumber);
 }
 
 void DataController::fileDone(bool wasInHand) {

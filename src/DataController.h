@@ -48,7 +48,29 @@ class DataController : public IDataController {
     uint64_t PendingMs() override;
 
   private:
+    // What became of one file: uploaded, or the last failed result and, when given up because
+    // the buffer was over its limit, that result's name.
+    struct UploadOutcome {
+        bool succeeded = false;
+        std::string errorName;
+        FileTransferInfo info;
+        FileTransferResult result = Success;
+    };
+
+    // The upload thread: pop a file, upload it until settled, report it, drop overflow.
     void fileUpload();
+    void setInHandDuration(uint32_t duration);
+    // Attempts until success, a result that ends the attempts, a full buffer, or Stop.
+    UploadOutcome uploadUntilSettled(FileTransferRequest& request);
+    void onUploaded();
+    // The reaction to a failed result; false when the attempts end (disabled, OtherError).
+    bool reactToFailure(FileTransferResult result, FileTransferRequest& request);
+    // Asks the host for credentials, waits for them and puts them into `request`.
+    void renewCredentials(FileTransferRequest& request);
+    // Warns the host (except for a first authentication error); returns the result's name.
+    std::string giveUpOnFullBuffer(FileTransferResult result);
+    // Reports the file and drops the overflow, unless a stop interrupted an unfinished upload.
+    void reportFile(int32_t& sequenceNumber, const UploadOutcome& outcome, uint32_t duration);
     FileTransferRequest PopStreamFile(int32_t sequenceNumber);
     bool waitAuthenticationInfo();
     void waitForFileDuration();
