@@ -1,3 +1,8 @@
+// DataController's upload loop. Guards: files reported out of order or with gaps in their
+// numbers, a warning not cleared by a success (or an error cleared), credentials not renewed
+// after an authentication error, retry and wait rules per result, the give-up table (names and
+// warning codes, overflow dropping), OtherError ending the loop, and Stop racing a transfer
+// (a cancelled transfer is no error; one that succeeded is still reported).
 #include <gtest/gtest.h>
 
 #include <chrono>
@@ -21,21 +26,6 @@ AwsInfo credentials(const std::string& tag) {
     return {"AK" + tag, "SK" + tag, "TK" + tag, "eu-west-1"};
 }
 
-// A file buffer that runs an action the first time the upload thread asks whether it is full,
-// i.e. right after a wait for credentials has ended and before the next attempt.
-class HookedFileBuffer : public FileBuffer {
-  public:
-    using FileBuffer::FileBuffer;
-    std::function<void()> onFirstFullTest;
-    bool IsBufferFull() override {
-        if (auto action = std::move(onFirstFullTest)) {
-            onFirstFullTest = nullptr;
-            action();
-        }
-        return FileBuffer::IsBufferFull();
-    }
-};
-
 // One controller over a real file buffer, a scripted transfer (none when `withTransfer` is
 // false) and a recording observer, given credentials "1" unless `withCredentials` is false.
 // Settings: no upload interval, 50 ms auth retry.
@@ -43,7 +33,7 @@ struct Rig {
     explicit Rig(int bufferFullSize = 100000, int uploadInterval = 0, bool withTransfer = true,
                  bool withCredentials = true)
         : transfer(std::make_shared<testsupport::ScriptedTransfer>()),
-          fileBuffer(std::make_shared<HookedFileBuffer>(bufferFullSize)) {
+          fileBuffer(std::make_shared<FileBuffer>(bufferFullSize)) {
         ModuleSettings s;
         s.bucketName = "rec";
         s.streamingId = "cam1";
@@ -74,7 +64,7 @@ struct Rig {
 
     testsupport::RecordingObserver observer;
     std::shared_ptr<testsupport::ScriptedTransfer> transfer;
-    std::shared_ptr<HookedFileBuffer> fileBuffer;
+    std::shared_ptr<FileBuffer> fileBuffer;
     std::shared_ptr<DataController> controller;
 };
 
@@ -141,21 +131,6 @@ TEST(DataControllerCredentials, AuthenticationErrorFetchesFreshCredentialsIntoTh
     EXPECT_EQ(requests[1].secretKey, "SKnew");
     EXPECT_EQ(requests[1].sessionToken, "TKnew");
     EXPECT_TRUE(rig.entries()[0].succeeded);
-}
-
-TEST(DataControllerCredentials, CredentialsAfterAWaitGaveUpDoNotReachTheFileInHand) {
-    Rig rig(100000, 0, true, false);
-    // No credentials: the first attempt is an authentication error without a transfer; the
-    // credentials arrive after that wait gave up, so the next attempt keeps the empty ones.
-    rig.fileBuffer->onFirstFullTest = [&] { rig.controller->SetAwsInfo(credentials("late")); };
-    rig.Push(1, 10);
-    rig.controller->Start();
-    ASSERT_TRUE(rig.WaitEntries(1));
-    rig.controller->Stop();
-    auto requests = rig.transfer->Requests();
-    ASSERT_EQ(requests.size(), 1u);
-    EXPECT_EQ(requests[0].accessKey, "");
-    EXPECT_EQ(rig.observer.TokenRequests(), 1u);
 }
 
 TEST(DataControllerRetries, NetworkErrorWaitsOneIntervalThenRetries) {
@@ -280,27 +255,8 @@ TEST(DataControllerOtherError, EndsTheThreadWithModuleErrorAndLaterFilesStay) {
         EXPECT_EQ(rig.observer.Errors(), std::vector<unsigned>{21});
         EXPECT_TRUE(rig.entries().empty());
         EXPECT_EQ(rig.fileBuffer->GetBufferCount(), 200u);
-        const char* reason = withTransfer ? "Other Error." : "create interface failed";
-        ASSERT_TRUE(log.Contains(reason));
-        EXPECT_EQ(log.Find(reason)[0].priority, 4);
-        if (!withTransfer) {
-            auto messages = log.Messages();
-            auto enter = std::find(messages.begin(), messages.end(), "Upload enter.");
-            ASSERT_NE(enter, messages.end());
-            EXPECT_EQ(*(enter + 1), "create interface failed");
-            for (const auto& m : messages) EXPECT_NE(m.rfind("Upload exit.", 0), 0u) << m;
-        }
         rig.controller->Stop();  // still returns
     }
-}
-
-TEST(DataControllerStopConcurrency, StopBeforeStartAndTwiceOnlyLogs) {
-    Rig rig;
-    LogCapture log;
-    rig.controller->Stop();
-    rig.controller->Stop();
-    EXPECT_EQ(log.Count("Stop exit."), 2u);
-    EXPECT_FALSE(rig.transfer->Cancelled());
 }
 
 TEST(DataControllerStopConcurrency, ACancelledTransferAtShutdownIsNoModuleError) {
