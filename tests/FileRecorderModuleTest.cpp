@@ -1,3 +1,9 @@
+// FileRecorderModule with the whole recorder in-process (test host, scripted transfer). Guards:
+// the start gate (ignore window dropping video and audio but keeping meta, a disconnection
+// ending the wait at once), a repeated connection reply starting a second pipeline, the
+// credential check, numbered files cut before IDRs end to end, the end-of-stream drain (tail to
+// the last sample; a store that is down ends at the deadline), and (under TSan) module error,
+// disconnection, drain and samples racing each other and the gate.
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -101,11 +107,6 @@ TEST(FileRecorderModuleGate, OpensInOrderDroppingVideoAndAudioOfTheIgnoreWindowH
     EXPECT_FALSE(log.Contains("ST: start filing"));
     ASSERT_TRUE(WaitUntil([&] { return log.Contains("ST: start filing"); }));
     EXPECT_FALSE(log.Contains("IDR: 111"));  // the window's video never reached the buffer
-    auto messages = log.Messages();
-    auto at = [&](const char* m) { return std::find(messages.begin(), messages.end(), m); };
-    EXPECT_LT(at("ST: wait for data receive"), at("ST: data receive event detected"));
-    EXPECT_LT(at("ST: data receive event detected"), at("ST: start filing"));
-    EXPECT_EQ(log.Find("ST: start filing")[0].priority, 11);
 
     p.Stream(1000, 3600, 1000);
     ASSERT_TRUE(WaitUntil([&] { return p.transfer->RequestCount() >= 1; }));
@@ -141,7 +142,7 @@ TEST(FileRecorderModuleGate, DisconnectBeforeAnySampleOrDuringTheWindowEndsTheWa
     }
 }
 
-TEST(FileRecorderModuleWiring, RepeatedConnectionReplyIsIgnoredTokenRequestHoldsTheStreamingId) {
+TEST(FileRecorderModuleWiring, RepeatedConnectionReplyIsIgnored) {
     LogCapture log;
     Pipeline p;
     p.Connect();
@@ -150,14 +151,6 @@ TEST(FileRecorderModuleWiring, RepeatedConnectionReplyIsIgnoredTokenRequestHolds
     EXPECT_EQ(countFrom(log, "src/StreamBuffer", "Start enter."), 1u);
     EXPECT_TRUE(log.Contains("connection reply while connected: ignored."));
     EXPECT_NE(p.h.Process().GetProcessStatus(), Error);
-
-    // A token request carries only the streaming id.
-    GetAWSSecureTokenRequest request;
-    p.h.Process().notifyGetAWSTokenRequest(request);
-    auto sent = p.h.Host().TokenRequests();
-    ASSERT_EQ(sent.size(), 1u);
-    EXPECT_EQ(sent[0].streamingId, "cam1");
-    EXPECT_EQ(sent[0].requestId + sent[0].roleName + sent[0].sessionName + sent[0].base, "");
 }
 
 TEST(FileRecorderModuleWiring, CredentialsAreCheckedInByteOrderOfTheirKeys) {
@@ -179,85 +172,56 @@ TEST(FileRecorderModuleWiring, CredentialsAreCheckedInByteOrderOfTheirKeys) {
         LogCapture log;
         Pipeline p;
         p.Connect();
-        bool accepted = p.h.Host().SetProperties(c.properties);
-        EXPECT_EQ(accepted, c.missing == nullptr);
-        auto messages = log.Messages();
-        EXPECT_EQ(std::count_if(messages.begin(), messages.end(),
-                                [](const std::string& m) { return m.find(" is empty") != m.npos; }),
-                  c.missing ? 1 : 0);
+        EXPECT_EQ(p.h.Host().SetProperties(c.properties), c.missing == nullptr);
+        // The first missing key in byte order is the one named.
         EXPECT_TRUE(!c.missing || log.Contains(std::string(c.missing) + " is empty"));
         EXPECT_EQ(log.Contains("SetAwsInfo enter."), c.missing == nullptr);
     }
 }
 
-TEST(FileRecorderModulePipeline, StreamBecomesNumberedFilesCutBeforeIdrs) {
+TEST(FileRecorderModulePipeline, StreamBecomesNumberedFilesCutBeforeIdrsAndTheDrainStoresTheTail) {
     LogCapture log;
     // Room for the whole stream: it is fed faster than real time.
     Pipeline p({"-uploadinterval", "2", "-bufferfullsize", "10"});
     p.transfer->SetInfo({4096, 12});
     p.Open(log);
-    p.Stream(0, 10000, 1000);
-    ASSERT_TRUE(WaitUntil([&] { return p.Notifies().size() == 4; }, 20000));
-
-    auto requests = p.Requests();
-    auto notifies = p.Notifies();
-    auto statuses = p.h.Host().TransmissionStatuses();
-    ASSERT_EQ(requests.size(), 4u);
-    ASSERT_EQ(statuses.size(), 4u);
-    const uint32_t expectedDurations[] = {1999, 2000, 2000, 2000};
-    for (size_t i = 0; i < requests.size(); ++i) {
-        SCOPED_TRACE(i);
-        const auto& r = requests[i];
-        EXPECT_EQ(notifies[i].entries.at(0).sequenceNumber, i + 1);
-        EXPECT_TRUE(notifies[i].entries.at(0).succeeded);
-        EXPECT_EQ(statuses[i].statusMap["UploadInfo"].find(
-                      "FileIndex, " + std::to_string(i + 1) +
-                      ", ErrorCode, Success, ResponseTime, 12, FileSize, 4096, BufferCount, "),
-                  0u);
-        EXPECT_EQ(r.sequenceNumber, static_cast<int64_t>(i + 1));
-        EXPECT_EQ(r.accessKey, "AK");
-        EXPECT_EQ(r.duration, expectedDurations[i]);
-        ASSERT_FALSE(r.video.empty());
-        EXPECT_TRUE(isIdr(r.video[0]));
-        EXPECT_EQ(r.video[0].timestamp, 2000 * i);  // each file opens at the IDR after the cut
-        uint64_t cut = 2000 * (i + 1) - 1;
-        for (const auto& a : r.audio) EXPECT_LT(a.timestamp, cut);
-        EXPECT_GE(r.audio.back().timestamp, cut - 20);
-        for (const auto& v : r.video) EXPECT_LT(v.timestamp, cut);
-    }
-    EXPECT_FALSE(log.Contains("queue overflow (video)"));
-
-    p.h.Host().Disconnection();
-    p.h.Process().stopProcess();
-    EXPECT_EQ(p.transfer->RequestCount(), 4u);  // the held tail is dropped by a disconnection
-}
-
-TEST(FileRecorderModuleDrain, EndOfStreamStoresTheTailToTheLastSample) {
-    LogCapture log;
-    Pipeline p({"-uploadinterval", "2", "-bufferfullsize", "10"});
-    p.Open(log);
-    auto start = std::chrono::steady_clock::now();
     EXPECT_TRUE(p.h.Process().drainProcess(30000));  // nothing held: returns at once
-    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(10));
     EXPECT_EQ(p.transfer->RequestCount(), 0u);
 
     p.Stream(0, 5000, 1000);
     EXPECT_TRUE(p.h.Process().drainProcess(20000));
-    // Everything was reported when the drain returned.
+    // Two files cut by the rule, then the tail to the newest sample (4980), inclusive; all
+    // reported when the drain returned.
     auto requests = p.Requests();
     auto notifies = p.Notifies();
+    auto statuses = p.h.Host().TransmissionStatuses();
     ASSERT_EQ(requests.size(), 3u);
     ASSERT_EQ(notifies.size(), 3u);
-    const auto& last = requests[2];
-    EXPECT_TRUE(isIdr(last.video.front()));
-    EXPECT_EQ(last.video.front().timestamp, 4000u);
-    EXPECT_EQ(last.video.back().timestamp, 4966u);  // the input's last frame
-    EXPECT_EQ(last.audio.back().timestamp, 4980u);  // and its last audio frame
-    uint32_t total = 0;
-    for (const auto& r : requests) total += r.duration;
-    EXPECT_EQ(total, 4981u);  // to the newest sample, inclusive
-    EXPECT_EQ(notifies[2].entries[0].duration, last.duration);
-    EXPECT_TRUE(notifies[2].entries[0].succeeded);
+    ASSERT_EQ(statuses.size(), 3u);
+    const uint32_t durations[] = {1999, 2000, 982};
+    uint64_t end = 0;
+    for (size_t i = 0; i < requests.size(); ++i) {
+        SCOPED_TRACE(i);
+        const auto& r = requests[i];
+        end += durations[i];
+        EXPECT_EQ(notifies[i].entries.at(0).sequenceNumber, i + 1);
+        EXPECT_TRUE(notifies[i].entries.at(0).succeeded);
+        EXPECT_EQ(notifies[i].entries.at(0).duration, durations[i]);
+        EXPECT_EQ(statuses[i].statusMap["UploadInfo"].find(
+                      "FileIndex, " + std::to_string(i + 1) +
+                      ", ErrorCode, Success, ResponseTime, 12, FileSize, 4096, BufferCount, "),
+                  0u);
+        EXPECT_EQ(r.accessKey, "AK");
+        EXPECT_EQ(r.duration, durations[i]);
+        ASSERT_FALSE(r.video.empty());
+        EXPECT_TRUE(isIdr(r.video[0]));
+        EXPECT_EQ(r.video[0].timestamp, 2000 * i);  // each file opens at the IDR after the cut
+        for (const auto& a : r.audio) EXPECT_LT(a.timestamp, end);
+        EXPECT_GE(r.audio.back().timestamp, end - 21);
+        for (const auto& v : r.video) EXPECT_LT(v.timestamp, end);
+    }
+    EXPECT_EQ(requests[2].video.back().timestamp, 4966u);  // the input's last frame
+    EXPECT_FALSE(log.Contains("queue overflow (video)"));
 }
 
 TEST(FileRecorderModuleDrain, AStoreThatIsDownEndsAtTheDeadlineNamingWhatIsDropped) {
@@ -271,13 +235,10 @@ TEST(FileRecorderModuleDrain, AStoreThatIsDownEndsAtTheDeadlineNamingWhatIsDropp
     auto took = std::chrono::steady_clock::now() - start;
     EXPECT_GE(took, std::chrono::milliseconds(700));
     EXPECT_LT(took, std::chrono::seconds(10));
-    auto records = log.Records();
-    auto named = std::find_if(records.begin(), records.end(), [](const LogRecord& r) {
-        return r.message.rfind("drain incomplete after 800 ms: 3 stream files (4981 ms of stream)",
-                               0) == 0;
-    });
-    ASSERT_NE(named, records.end());
-    EXPECT_EQ(named->priority, 5);
+    auto messages = log.Messages();
+    EXPECT_TRUE(std::any_of(messages.begin(), messages.end(), [](const std::string& m) {
+        return m.rfind("drain incomplete after 800 ms: 3 stream files (4981 ms of stream)", 0) == 0;
+    }));
     auto disconnectStart = std::chrono::steady_clock::now();
     p.h.Host().Disconnection();  // drops them, as a disconnection does
     EXPECT_LT(std::chrono::steady_clock::now() - disconnectStart, std::chrono::seconds(5));
