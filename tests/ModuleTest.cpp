@@ -1,3 +1,8 @@
+// Module's worker queues. Guards: a full queue that blocks or reorders instead of dropping the
+// newest sample, StopThreads that hangs on a held hook or leaks queued samples, ClearQueues
+// removing flush markers, a flush returning before the samples queued ahead of it were handled
+// (also where the allocator reuses an earlier marker's address; this runs without sanitizer
+// quarantine thanks to the recycling allocator below), and producers racing StopThreads.
 #include <gtest/gtest.h>
 
 #include <atomic>
@@ -137,10 +142,7 @@ TEST(ModuleQueues, AFullQueueDropsTheNewestSampleWithOneLineAndKeepsOrder) {
     for (uint64_t t = 1; t <= 50; ++t) module.PushVideo(MakeSample(t));  // fills the queue
     EXPECT_EQ(log.Count("queue overflow (video)"), 0u);
     module.PushVideo(MakeSample(999));
-    auto overflow = log.Find("queue overflow (video)");
-    ASSERT_EQ(overflow.size(), 1u);
-    EXPECT_EQ(overflow[0].priority, 5);
-    EXPECT_TRUE(overflow[0].file.empty());
+    EXPECT_EQ(log.Count("queue overflow (video)"), 1u);
 
     module.Release();
     ASSERT_TRUE(WaitUntil([&] { return module.Count(module.video) == 51; }));
@@ -198,19 +200,6 @@ TEST(ModuleWorkers, ClearQueuesBeforeInitializeEmptiesAfterItKeepsMarkers) {
     EXPECT_EQ(module.Copy(module.meta), std::vector<uint64_t>{4});
 }
 
-TEST(ModuleWorkers, EveryFlushWaitsForWhatWasQueuedBeforeItAndMarkersNeverReachTheHooks) {
-    RecordingModule module;
-    module.Initialize(nullptr);
-    module.StartThreads();
-    module.PushAudio(std::make_shared<StreamData>());
-    module.FlushQueues();  // a first flush: markers seen
-    for (int round = 0; round < 3; ++round) {
-        for (int i = 0; i < 15; ++i) module.PushAudio(MakeSample(round * 100 + i));
-        module.FlushQueues();
-        EXPECT_EQ(module.Count(module.audio), static_cast<size_t>((round + 1) * 15));
-    }
-}
-
 // A flush must wait for its own marker even where an earlier marker's memory is reused: the
 // video hook is held while samples and the new marker queue behind it.
 TEST(ModuleWorkers, AFlushWaitsForTheSamplesBeforeItWhereAnEarlierMarkerLay) {
@@ -251,6 +240,8 @@ TEST(ModuleWorkers, AFlushWaitsForTheSamplesBeforeItWhereAnEarlierMarkerLay) {
         module.Release();
         flusher.join();
         EXPECT_EQ(handledAtReturn, 10u);
+        // Flush markers never reach the hooks.
+        EXPECT_EQ(module.Count(module.audio) + module.Count(module.meta), 2u);
     }
 }
 
