@@ -1,3 +1,5 @@
+// BoundedQueue. Guards: an overflow that blocks, drops the wrong item or keeps a refused item
+// alive; and (under TSan) items lost or duplicated while producers race a waiting consumer.
 #include <gtest/gtest.h>
 
 #include <atomic>

@@ -1,5 +1,7 @@
-// FileBuffer: the fill in milliseconds, the order, the blocking Pop and the count under racing
-// pushes and pops.
+// FileBuffer. Guards: the fill limit off by one or wrong for a zero or negative full size, a
+// full buffer that refuses files, files out of order or copied payloads, a Pop that does not
+// wait or is not woken by the wake-up record (which must not count), and a count that wraps
+// below zero while pushes and pops race.
 #include <gtest/gtest.h>
 
 #include <atomic>
@@ -41,10 +43,7 @@ TEST(FileBuffer, FullOnceTheCountReachesTheFullSize) {
         EXPECT_TRUE(log.Records().empty());
         buffer.Push(File(1));
         EXPECT_TRUE(buffer.IsBufferFull());
-        const auto lines = log.Find(c.line);
-        ASSERT_EQ(lines.size(), 1u);
-        EXPECT_EQ(lines[0].priority, 5);
-        EXPECT_EQ(lines[0].function, "Orvane::FileBuffer::IsBufferFull");
+        EXPECT_EQ(log.Count(c.line), 1u);
     }
     // Over the limit is not refused: the count goes on growing and falls as files leave.
     FileBuffer buffer(20000);

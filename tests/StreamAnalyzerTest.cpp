@@ -1,3 +1,7 @@
+// StreamAnalyzer and NalAnalyzer. Guards: a key frame missed or invented in real H.264/H.265
+// streams in any framing (3- or 4-byte start codes, length prefixes), an HEVC CRA taken for an
+// IDR, one codec's rules applied to the other, reads past the end of truncated or random input,
+// and the codec type selecting the wrong parser.
 #include "platform/nal/StreamAnalyzer.h"
 
 extern "C" {

@@ -1,3 +1,5 @@
+// StreamData. Guards: an attribute read from the wrong byte offset (or bytes between fields
+// leaking into one), and a payload copied or released while a stream file still holds it.
 #include <gtest/gtest.h>
 
 #include <tuple>
