@@ -123,7 +123,7 @@ class RecordingModule : public Module {
 
 }  // namespace
 
-TEST(ModuleQueues, AFullQueueDropsTheNewestSampleWithOneLineAndKeepsOrder) {
+TEST(ModuleQueues, AFullQueueDropsTheNewestSampleWithOneLineCountedAndKeepsOrder) {
     LogCapture log;
     RecordingModule module;
     module.Initialize(nullptr);
@@ -141,6 +141,11 @@ TEST(ModuleQueues, AFullQueueDropsTheNewestSampleWithOneLineAndKeepsOrder) {
     ASSERT_EQ(overflow.size(), 1u);
     EXPECT_EQ(overflow[0].priority, 5);
     EXPECT_TRUE(overflow[0].file.empty());
+    const Module::QueueCounts counts = module.Counts();
+    EXPECT_EQ(std::vector<uint64_t>(counts.received, counts.received + 3),
+              (std::vector<uint64_t>{52, 21, 22}));
+    EXPECT_EQ(std::vector<uint64_t>(counts.overflows, counts.overflows + 3),
+              (std::vector<uint64_t>{1, 1, 2}));
 
     module.Release();
     ASSERT_TRUE(WaitUntil([&] { return module.Count(module.video) == 51; }));
