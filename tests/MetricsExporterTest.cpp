@@ -1,11 +1,8 @@
 // The metrics exporter: what the object events and the process's readings turn into, read from
 // the registry as a scrape would; /healthz by process state; an address it cannot listen at.
-#include <arpa/inet.h>
 #include <gtest/gtest.h>
-#include <netinet/in.h>
 #include <prometheus/metric_family.h>
 #include <sys/socket.h>
-#include <unistd.h>
 
 #include <mutex>
 #include <string>
@@ -71,19 +68,6 @@ struct Expected {
     Labels labels;
     double value;
 };
-
-// A port on 127.0.0.1 that was free a moment ago.
-int FreePort() {
-    int fd = socket(AF_INET, SOCK_STREAM, 0);
-    sockaddr_in address{};
-    address.sin_family = AF_INET;
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof address);
-    socklen_t length = sizeof address;
-    getsockname(fd, reinterpret_cast<sockaddr*>(&address), &length);
-    close(fd);
-    return ntohs(address.sin_port);
-}
 
 }  // namespace
 
@@ -161,7 +145,7 @@ TEST(MetricsExporterTest, HealthFollowsTheProcessStateAndABusyAddressFailsToServ
         std::lock_guard<std::mutex> lock(mutex);
         return now;
     });
-    const std::string address = "127.0.0.1:" + std::to_string(FreePort());
+    const std::string address = "127.0.0.1:" + std::to_string(testsupport::FreePort(SOCK_STREAM));
     std::string why;
     ASSERT_TRUE(exporter.Serve(address, &why)) << why;
     const struct {
