@@ -8,18 +8,34 @@ Module::Module() = default;
 Module::~Module() = default;
 
 void Module::PushVideo(std::shared_ptr<StreamData> sample) {
-    if (!lanes_[kVideo].queue.Push(std::move(sample)))
-        Logger::Put(5, nullptr, nullptr, 0, "queue overflow (video)");
+    push(kVideo, std::move(sample));
 }
 
 void Module::PushAudio(std::shared_ptr<StreamData> sample) {
-    if (!lanes_[kAudio].queue.Push(std::move(sample)))
-        Logger::Put(5, nullptr, nullptr, 0, "queue overflow (audio)");
+    push(kAudio, std::move(sample));
 }
 
 void Module::PushMeta(std::shared_ptr<StreamData> sample) {
-    if (!lanes_[kMeta].queue.Push(std::move(sample)))
-        Logger::Put(5, nullptr, nullptr, 0, "queue overflow (meta)");
+    push(kMeta, std::move(sample));
+}
+
+void Module::push(Media media, std::shared_ptr<StreamData> sample) {
+    static const char* const kOverflowLines[kMediaCount] = {
+        "queue overflow (video)", "queue overflow (audio)", "queue overflow (meta)"};
+    Lane& lane = lanes_[media];
+    lane.received.fetch_add(1, std::memory_order_relaxed);
+    if (lane.queue.Push(std::move(sample))) return;
+    lane.overflows.fetch_add(1, std::memory_order_relaxed);
+    Logger::Put(5, nullptr, nullptr, 0, "%s", kOverflowLines[media]);
+}
+
+Module::QueueCounts Module::Counts() const {
+    QueueCounts counts;
+    for (int media = kVideo; media < kMediaCount; ++media) {
+        counts.received[media] = lanes_[media].received.load(std::memory_order_relaxed);
+        counts.overflows[media] = lanes_[media].overflows.load(std::memory_order_relaxed);
+    }
+    return counts;
 }
 
 void Module::Restart() {

@@ -4,9 +4,10 @@
 // queue. Producers (any thread) only enqueue and never block: a full queue drops the newest
 // sample with one "queue overflow (...)" line. That suits a live input, where waiting would only
 // move the loss into the socket; an input that can wait (a file) asks WaitForRoom before it
-// pushes and so never loses a sample. Each worker pops its queue in order and calls
-// the derived class's Process* hook; no Module lock is held while a hook runs, so the three
-// hooks run concurrently and the derived class synchronises what they share.
+// pushes and so never loses a sample. Every push is counted per media (one relaxed atomic
+// increment, and one more when the queue was full), for monitoring. Each worker pops its queue
+// in order and calls the derived class's Process* hook; no Module lock is held while a hook runs,
+// so the three hooks run concurrently and the derived class synchronises what they share.
 //
 // Shutdown and flushing use marker samples (payloadSize 0), which never reach the hooks.
 // StartThreads/StopThreads/FlushQueues are called from one controlling thread, never from a
@@ -47,6 +48,15 @@ class Module : public ModuleInterface {
     bool WaitForRoom(size_t video, size_t audio, size_t meta,
                      std::chrono::steady_clock::time_point deadline) override;
 
+    // Samples pushed (accepted or not) and refused for a full queue since construction, per
+    // media: [0] video, [1] audio, [2] meta. Any thread; the three media are read one after the
+    // other, not as one snapshot.
+    struct QueueCounts {
+        uint64_t received[3] = {0, 0, 0};
+        uint64_t overflows[3] = {0, 0, 0};
+    };
+    QueueCounts Counts() const;
+
     // Makes Clear keep markers and drop samples, then calls OnInitialize.
     bool Initialize(std::shared_ptr<void> parameter);
     // Starts the three workers. Only when none runs. Throws std::system_error when a thread
@@ -68,7 +78,12 @@ class Module : public ModuleInterface {
         std::condition_variable markerHandled;  // a marker was handled; FlushQueues waits
         uint64_t markerTicket = 0;  // queue ticket of the newest marker handled; markerMutex_
         std::atomic<bool> running{false};
+        std::atomic<uint64_t> received{0};   // relaxed: a count, orders nothing
+        std::atomic<uint64_t> overflows{0};  // relaxed
     };
+
+    // Counts the push and appends `sample`; a full queue drops it, counted, with the overflow line.
+    void push(Media media, std::shared_ptr<StreamData> sample);
 
     void workerLoop(Media media);
     void process(Media media, std::shared_ptr<StreamData> sample);

@@ -8,8 +8,8 @@ packages=(
   libcurl4-openssl-dev libssl-dev
   libspdlog-dev libfmt-dev nlohmann-json3-dev
   libunwind-dev libdw-dev libiberty-dev
-  libgtest-dev libgmock-dev libbenchmark-dev
-  ffmpeg awscli chromium
+  libgtest-dev libgmock-dev libbenchmark-dev prometheus-cpp-dev
+  ffmpeg awscli chromium curl
 )
 missing=()
 for p in "${packages[@]}"; do

@@ -40,6 +40,7 @@ class FileBuffer : public IFileBuffer {
     bool IsBufferFull() override;
     uint64_t GetBufferCount() override;
     uint64_t FilesPushed() override;
+    uint64_t LimitMs() override { return bufferFullSize_; }
 
   private:
     static constexpr uint64_t kCapacity = 2147483647;   // records; in practice unbounded

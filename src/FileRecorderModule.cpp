@@ -184,6 +184,16 @@ FileRecorderModule::DrainResult FileRecorderModule::Drain(
     return result;
 }
 
+void FileRecorderModule::FileBufferLevel(uint64_t* levelMs, uint64_t* limitMs) const {
+    std::shared_ptr<IFileBuffer> fileBuffer;
+    {
+        std::lock_guard<std::mutex> lock(componentsMutex_);
+        fileBuffer = fileBuffer_;
+    }
+    *levelMs = fileBuffer ? fileBuffer->GetBufferCount() : 0;
+    *limitMs = fileBuffer ? fileBuffer->LimitMs() : 0;
+}
+
 void FileRecorderModule::SetTransferFactory(
     std::function<std::shared_ptr<IFileTransfer>()> factory) {
     transferFactory_ = std::move(factory);

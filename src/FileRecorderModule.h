@@ -65,6 +65,9 @@ class FileRecorderModule : public Module {
     // drain then ends at once, incomplete.
     DrainResult Drain(std::chrono::steady_clock::time_point deadline);
 
+    // The file buffer's level and limit in ms, for monitoring; both 0 before Connect. Any thread.
+    void FileBufferLevel(uint64_t* levelMs, uint64_t* limitMs) const;
+
     // Hands credentials to the data controller; before Connect they are kept and handed over
     // when the controller is created.
     void SetAwsInfo(const AwsInfo& info);

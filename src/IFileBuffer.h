@@ -22,6 +22,9 @@ class IFileBuffer {
     // Stream files (not empty records) queued since construction, for the end-of-stream drain;
     // a buffer that is never drained (a test double) may keep the answer 0.
     virtual uint64_t FilesPushed() { return 0; }
+    // The buffer count (ms) at which the buffer is full; 0 when it has no limit to tell (a
+    // test double). Any thread.
+    virtual uint64_t LimitMs() { return 0; }
 };
 
 }  // namespace Orvane

@@ -100,6 +100,17 @@ bool ProcessControl::checkInput(const InputInfo& input) {
     return false;
 }
 
+void ProcessControl::moduleReadings(ProcessReadings& readings) {
+    // module_ is replaced only by initializeProcess, which runs before any reader starts.
+    if (!module_) return;
+    const Module::QueueCounts counts = module_->Counts();
+    for (int media = 0; media < ProcessReadings::kMediaCount; ++media) {
+        readings.samplesReceived[media] = counts.received[media];
+        readings.queueOverflows[media] = counts.overflows[media];
+    }
+    module_->FileBufferLevel(&readings.fileBufferMs, &readings.fileBufferLimitMs);
+}
+
 bool ProcessControl::initializeProcess(std::string) {
     // A module whose workers run is never dropped: replacing it would destroy running threads.
     if (module_ && threadsStarted_) {

@@ -41,6 +41,8 @@ class ProcessControl : public BaseProcess, public INotifyObserver {
     // The seven recorder options, for the usage text.
     static std::vector<OptionHelp> RecorderOptions();
     std::vector<OptionHelp> moduleOptions() const override { return RecorderOptions(); }
+    // The module's queue counts and its file buffer's level and limit.
+    void moduleReadings(ProcessReadings& readings) override;
     // Refuses an input whose video codec is not the one -kct names.
     bool checkInput(const InputInfo& input) override;
 

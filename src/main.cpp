@@ -2,12 +2,15 @@
 //
 // Exit statuses (ExitStatus): 0 after a normal run, 1 when the start fails, 2 when the recorder
 // stopped on a module error, 3 when every stream file was given up and none stored. --help and
-// --version print to stdout and exit 0 without starting anything.
+// --version print to stdout and exit 0 without starting anything. With -metrics, the metrics
+// server starts once the process is initialized and stops before the process is torn down; an
+// address it cannot listen at fails the start like a bad option.
 #include <cstdio>
 #include <memory>
 #include <string>
 
 #include "platform/logger/Logger.h"
+#include "platform/metrics/MetricsExporter.h"
 #include "platform/playback/PlaylistWriter.h"
 #include "src/ProcessControl.h"
 
@@ -42,7 +45,21 @@ int main(int argc, char** argv) {
         std::unique_ptr<PlaylistWriter> playlists;
         if (CurrentFrameworkOptions().playlist)
             playlists = PlaylistWriter::Subscribed(CurrentFrameworkOptions().keyPrefix);
-        if (!process.Initialize()) {
+        // Declared after the process, so it is destroyed first: it reads the process.
+        std::unique_ptr<MetricsExporter> metrics;
+        bool started = process.Initialize();
+        if (started && !process.Options().metrics.empty()) {
+            metrics = std::make_unique<MetricsExporter>([&process] { return process.Readings(); });
+            std::string why;
+            started = metrics->Serve(process.Options().metrics, &why);
+            if (started) {
+                Logger::Put(11, nullptr, "main", 0, "metrics at http://%s/metrics",
+                            process.Options().metrics.c_str());
+            } else {
+                Logger::Put(4, nullptr, "main", 0, "%s", why.c_str());
+            }
+        }
+        if (!started) {
             Logger::Put(11, nullptr, "main", 0, "Initialize Error.");
             Logger::Put(4, nullptr, "main", 0, "%s --help lists the options, with an example",
                         kProgram);

@@ -28,6 +28,7 @@ namespace {
 
 namespace fs = std::filesystem;
 using testsupport::BuildPath;
+using testsupport::FreePort;
 using testsupport::MediaClip;
 using testsupport::ReadFile;
 using testsupport::RunProcess;
@@ -152,19 +153,6 @@ Notified ReadStatus(const std::string& path) {
         n.uploadInfos += line.find("\"UploadInfo\"") != std::string::npos;
     }
     return n;
-}
-
-// A port on 127.0.0.1 that was free a moment ago (nothing listens on it afterwards).
-int FreePort(int type) {
-    int fd = socket(AF_INET, type, 0);
-    sockaddr_in address{};
-    address.sin_family = AF_INET;
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof address);
-    socklen_t length = sizeof address;
-    getsockname(fd, reinterpret_cast<sockaddr*>(&address), &length);
-    close(fd);
-    return ntohs(address.sin_port);
 }
 
 // Records each clip into a local directory and checks the objects against the input's frames.

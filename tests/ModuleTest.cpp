@@ -128,7 +128,7 @@ class RecordingModule : public Module {
 
 }  // namespace
 
-TEST(ModuleQueues, AFullQueueDropsTheNewestSampleWithOneLineAndKeepsOrder) {
+TEST(ModuleQueues, AFullQueueDropsTheNewestSampleWithOneLineCountedAndKeepsOrder) {
     LogCapture log;
     RecordingModule module;
     module.Initialize(nullptr);
@@ -143,6 +143,11 @@ TEST(ModuleQueues, AFullQueueDropsTheNewestSampleWithOneLineAndKeepsOrder) {
     EXPECT_EQ(log.Count("queue overflow (video)"), 0u);
     module.PushVideo(MakeSample(999));
     EXPECT_EQ(log.Count("queue overflow (video)"), 1u);
+    const Module::QueueCounts counts = module.Counts();
+    EXPECT_EQ(std::vector<uint64_t>(counts.received, counts.received + 3),
+              (std::vector<uint64_t>{52, 21, 22}));
+    EXPECT_EQ(std::vector<uint64_t>(counts.overflows, counts.overflows + 3),
+              (std::vector<uint64_t>{1, 1, 2}));
 
     module.Release();
     ASSERT_TRUE(WaitUntil([&] { return module.Count(module.video) == 51; }));

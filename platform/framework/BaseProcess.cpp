@@ -119,6 +119,23 @@ std::string BaseProcess::getParentStreamName() {
     return options_.parent;
 }
 
+ProcessReadings BaseProcess::Readings() {
+    ProcessReadings readings;
+    std::shared_ptr<IModuleHost> host;
+    {
+        std::lock_guard<std::mutex> lock(mutex_);
+        readings.state = state_;
+        readings.code = code_;
+        readings.files = filesByResult_;
+        host = host_;
+    }
+    if (host) host->AddReadings(readings);
+    moduleReadings(readings);
+    return readings;
+}
+
+void BaseProcess::moduleReadings(ProcessReadings&) {}
+
 void BaseProcess::SetProcessStatus(VqProcessState state, unsigned int code) {
     std::shared_ptr<IModuleHost> host;
     {
@@ -161,6 +178,9 @@ VqResult BaseProcess::SendLastSequenceNumNotify(const std::string& destination,
     {
         std::lock_guard<std::mutex> lock(mutex_);
         for (const auto& entry : message.entries) {
+            ++filesByResult_[entry.succeeded           ? std::string("Success")
+                             : entry.errorName.empty() ? std::string("Unnamed")
+                                                       : entry.errorName];
             if (entry.succeeded) {
                 ++storedFiles_;
             } else {

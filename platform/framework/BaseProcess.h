@@ -27,6 +27,7 @@
 
 #include "platform/framework/FrameworkOptions.h"
 #include "platform/framework/ModuleHost.h"
+#include "platform/framework/ProcessReadings.h"
 #include "platform/framework/ReceivedSample.h"
 #include "platform/framework/StatusWriter.h"
 #include "platform/framework/VqMessages.h"
@@ -103,6 +104,12 @@ class BaseProcess : public IVqModuleMessageObserver,
     std::string getParentStreamName();
     const FrameworkOptions& Options() const { return options_; }
 
+    // The process's counts for monitoring: its state, the stream files done by result, and what
+    // the host (AddReadings) and the module (moduleReadings) count. Any thread; takes the
+    // process's lock briefly. Valid before Initialize and after Uninitialize too (the parts of
+    // a host that is gone read 0).
+    ProcessReadings Readings();
+
     void SetProcessStatus(VqProcessState state, unsigned int code);
     VqProcessState GetProcessStatus();
     unsigned int GetProcessStatusCode();
@@ -141,6 +148,11 @@ class BaseProcess : public IVqModuleMessageObserver,
     // it. The base drops every sample and returns true at once.
     virtual bool waitForSampleRoom(size_t video, size_t audio, size_t meta,
                                    std::chrono::steady_clock::time_point deadline);
+
+    // Adds what the module counts (queues, file buffer) to `readings`. Any thread, concurrently
+    // with every other hook, after Initialize; must not block. The base counts nothing.
+    virtual void moduleReadings(ProcessReadings& readings);
+
     // Sample hooks (receive threads): the base drops the samples.
     void notifyVideoData(std::shared_ptr<ReceivedSample>) override {}
     void notifyAudioData(std::shared_ptr<ReceivedSample>) override {}
@@ -161,6 +173,7 @@ class BaseProcess : public IVqModuleMessageObserver,
     uint64_t storedFiles_ = 0;   // sequence entries that succeeded
     uint64_t givenUpFiles_ = 0;  // sequence entries that did not
     std::string lastError_;      // errorName of the last entry given up, BufferOver last
+    std::map<std::string, uint64_t> filesByResult_;  // "Success" or the errorName given
 };
 
 // Creates the host that records `options.input`; null (with a log line saying why) when the

@@ -1,5 +1,7 @@
 #include "platform/framework/FrameworkOptions.h"
 
+#include <arpa/inet.h>
+
 #include <cstdlib>
 #include <mutex>
 
@@ -26,6 +28,20 @@ std::string baseName(const std::string& input) {
         out += ok ? c : '_';
     }
     return out.empty() ? std::string("stream") : out;
+}
+
+// "IPv4:PORT" or "[IPv6]:PORT" with a port from 1 to 65535: what the metrics server can bind.
+bool isListenAddress(const std::string& text) {
+    const auto colon = text.rfind(':');
+    if (colon == std::string::npos) return false;
+    const std::string host = text.substr(0, colon);
+    int port = 0;
+    if (!CommandLine::ParseInt(text.substr(colon + 1), port) || port < 1 || port > 65535)
+        return false;
+    unsigned char address[sizeof(in6_addr)];
+    if (host.size() > 2 && host.front() == '[' && host.back() == ']')
+        return inet_pton(AF_INET6, host.substr(1, host.size() - 2).c_str(), address) == 1;
+    return inet_pton(AF_INET, host.c_str(), address) == 1;
 }
 
 std::mutex g_optionsMutex;
@@ -78,6 +94,11 @@ FrameworkOptions FrameworkOptions::Read(const CommandLine& cl, std::vector<std::
     }
     cl.Find("logfile", o.logFile);
     cl.Find("status", o.statusPath);
+    if (cl.Find("metrics", o.metrics) && !isListenAddress(o.metrics)) {
+        errors.push_back("-metrics needs IP:PORT (127.0.0.1:9464, [::1]:9464), got \"" + o.metrics +
+                         "\"");
+        o.metrics.clear();
+    }
     o.upload = UploadOptions::Read(cl, errors);
     return o;
 }
@@ -109,6 +130,7 @@ std::vector<OptionHelp> FrameworkOptions::Help() {
         {"draintimeout", "S", "30", "at the end, store what is held for at most S seconds"},
         {"parent", "NAME", "host", "destination of every message"},
         {"status", "PATH", "stdout", "where the messages go, one JSON object per line"},
+        {"metrics", "IP:PORT", "off", "serve Prometheus /metrics and /healthz there"},
         {"logfile", "PATH", "stderr", "log destination"},
         {"loglevel", "N", "11", "log lines with a priority number above N are not written"},
     };

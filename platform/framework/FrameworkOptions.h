@@ -30,6 +30,7 @@ struct FrameworkOptions {
     int logLevel = 11;                 // -loglevel
     std::string logFile;               // -logfile, empty: stderr
     std::string statusPath = "-";      // -status, "-": stdout
+    std::string metrics;               // -metrics IP:PORT where /metrics is served; empty: off
     UploadOptions upload;              // -sse, -storageclass, -acl, -tagging, -addressing, ...
 
     // Reads every option; problems (unreadable numbers) are appended to `errors`, one sentence

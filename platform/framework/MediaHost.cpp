@@ -144,6 +144,11 @@ void MediaHost::OnProcessStatus(VqProcessState state, unsigned int code) {
     Stop();
 }
 
+void MediaHost::AddReadings(ProcessReadings& readings) const {
+    readings.inputReopenings = reopenings_.load(std::memory_order_relaxed);
+    readings.clockRebases = clock_.Rebases();
+}
+
 void MediaHost::deliverCredentials(BaseProcess& process, const char* occasion, bool refresh) {
     handOver(process, credentials_->Fetch(refresh), occasion);
 }
@@ -174,6 +179,7 @@ bool MediaHost::reopen(std::string why) {
         auto input = std::make_unique<MediaInput>(options_.input, live_, stop_);
         if (input->Open(&why)) {
             input_ = std::move(input);
+            reopenings_.fetch_add(1, std::memory_order_relaxed);
             Logger::Put(11, kFile, fn, __LINE__, "input \"%s\" reopened", shownInput_.c_str());
             return true;
         }

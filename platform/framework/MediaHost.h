@@ -68,6 +68,8 @@ class MediaHost : public IModuleHost {
     void OnTokenRequest(const GetAWSSecureTokenRequest& request) override;
     void OnLastSequenceNumNotify(const LastSequenceNumNotify& message) override;
     void OnProcessStatus(VqProcessState state, unsigned int code) override;
+    // Input reopenings and clock re-basings so far.
+    void AddReadings(ProcessReadings& readings) const override;
 
     // Ends the run as the first SIGINT does (any thread, also before Run).
     void Stop();
@@ -115,6 +117,7 @@ class MediaHost : public IModuleHost {
     uint64_t packetNumbers_[SampleClock::kTrackCount] = {0, 0, 0};
     uint64_t delivered_ = 0;  // samples handed to the module
     std::chrono::seconds reopenPause_ = kFirstReopenPause;
+    std::atomic<uint64_t> reopenings_{0};  // the input opened again; relaxed, a count
     std::string endReason_;  // why reading ended; written by the receive thread before it ends
     std::thread receiver_;
     // Renews credentials before they expire on a thread of its own, from the connection reply

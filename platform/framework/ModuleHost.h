@@ -7,6 +7,7 @@
 // thread) and may be concurrent with each other and with Run.
 #pragma once
 
+#include "platform/framework/ProcessReadings.h"
 #include "platform/framework/VqMessages.h"
 #include "platform/framework/VqResult.h"
 
@@ -28,4 +29,8 @@ class IModuleHost {
     virtual void OnLastSequenceNumNotify(const LastSequenceNumNotify&) {}
     virtual void OnTransmissionStatus(const TransferStatusNotify&) {}
     virtual void OnProcessStatus(VqProcessState, unsigned int /*code*/) {}
+
+    // Adds what the host counts (input reopenings, clock re-basings) to `readings`. Any thread,
+    // concurrently with Run; it must not block. The base counts nothing.
+    virtual void AddReadings(ProcessReadings&) const {}
 };

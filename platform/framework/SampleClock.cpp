@@ -74,7 +74,7 @@ bool SampleClock::Place(Track track, bool hasPts, int64_t ptsUs, bool hasDts, in
             const int64_t jump = dtsUs + offset - target;
             offset = target - dtsUs;
             epochOffsetUs_ = offset;
-            ++rebases_;
+            rebases_.fetch_add(1, std::memory_order_relaxed);
             Logger::Put(5, kFile, kFunction, __LINE__,
                         "the source clock of the %s track jumped by %+.3f s: re-based to go on "
                         "at %.3f s",

@@ -17,9 +17,11 @@
 // The clock lives as long as the host's input, across reopenings of a live input, so that a
 // reconnect continues the timeline instead of restarting it.
 //
-// Threads: not thread-safe; the host's receive thread owns it.
+// Threads: not thread-safe; the host's receive thread owns it. Only Rebases may be read on any
+// thread (for monitoring).
 #pragma once
 
+#include <atomic>
 #include <cstdint>
 
 class SampleClock {
@@ -48,7 +50,7 @@ class SampleClock {
     // first packet.
     int64_t NewestUs() const { return newestUs_; }
     uint64_t DroppedWithoutTimestamp() const { return dropped_; }
-    uint64_t Rebases() const { return rebases_; }
+    uint64_t Rebases() const { return rebases_.load(std::memory_order_relaxed); }
 
   private:
     struct TrackState {
@@ -64,6 +66,6 @@ class SampleClock {
     int64_t epochOffsetUs_ = 0;  // the offset of the newest re-basing (or of the origin)
     int64_t newestUs_ = 0;
     uint64_t dropped_ = 0;
-    uint64_t rebases_ = 0;
+    std::atomic<uint64_t> rebases_{0};  // relaxed: a count, orders nothing
     TrackState tracks_[kTrackCount];
 };

@@ -75,6 +75,10 @@ std::string BuildPath(const std::string& relative);
 // `ffmpeg -y -v error <args> <path>`. Returns its path; empty on failure.
 std::string MediaClip(const std::string& fileName, const std::vector<std::string>& args);
 
+// A port on 127.0.0.1 for sockets of `type` (SOCK_STREAM, SOCK_DGRAM) that was free a moment
+// ago: nothing listens on it afterwards.
+int FreePort(int type);
+
 // Reads a whole file; empty when it cannot be read.
 std::string ReadFile(const std::string& path);
 // Writes `text` to `path`, replacing what was there; returns `path`.
