@@ -44,6 +44,7 @@ bench: deps
 	@cmake --build build-bench -j $(JOBS)
 	@for b in build-bench/bench/bench_*; do [ -x "$$b" ] && "$$b"; done
 	@bash bench/compare_segmenter.sh build-bench
+	@N=50 DURATION=40 bash bench/scale.sh build-bench
 
 format:
 	@git ls-files '*.cpp' '*.h' | xargs clang-format -i
