@@ -1,6 +1,7 @@
 #include "platform/framework/BaseProcess.h"
 
 #include <set>
+#include <utility>
 
 #include "platform/logger/Logger.h"
 
@@ -100,7 +101,7 @@ void BaseProcess::Uninitialize() {
 bool BaseProcess::GetArgument_str(std::string name, std::string& value, std::string defaultValue) {
     if (!name.empty() && name[0] == '-') name.erase(0, 1);
     if (commandLine_.Find(name, value)) return true;
-    value = defaultValue;
+    value = std::move(defaultValue);
     return false;
 }
 
