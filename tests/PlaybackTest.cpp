@@ -116,18 +116,6 @@ std::vector<std::string> HourPlaylists(const std::string& dir) {
     return found;
 }
 
-int FreeUdpPort() {
-    int fd = socket(AF_INET, SOCK_DGRAM, 0);
-    sockaddr_in address{};
-    address.sin_family = AF_INET;
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof address);
-    socklen_t length = sizeof address;
-    getsockname(fd, reinterpret_cast<sockaddr*>(&address), &length);
-    close(fd);
-    return ntohs(address.sin_port);
-}
-
 // Each object format: the run's objects (behind the run's one init segment for fragmented MP4)
 // decode to the same frames as the playlists.
 TEST(PlaybackTest, RecordedRunPlaysThroughItsPlaylists) {
@@ -169,7 +157,7 @@ TEST(PlaybackTest, InputOpenedAgainIsADiscontinuity) {
     const std::string clip = Clip(3);
     ASSERT_FALSE(clip.empty());
     const std::string dir = Scratch("reopen");
-    const std::string url = "udp://127.0.0.1:" + std::to_string(FreeUdpPort());
+    const std::string url = "udp://127.0.0.1:" + std::to_string(testsupport::FreePort(SOCK_DGRAM));
     const Args sender = Words("ffmpeg -v error -re -i") + Args{clip} + Words("-c copy -f mpegts") +
                         Args{url + "?pkt_size=1316"};
     // Ends by itself 5 s of input in: 3 s of the first sending and 2 s of the second.
