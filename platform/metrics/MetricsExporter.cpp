@@ -75,80 +75,62 @@ void raiseTo(prometheus::Counter& counter, uint64_t total) {
     if (value > counter.Value()) counter.Increment(value - counter.Value());
 }
 
+// A metric family registered in `registry`.
+template <typename Metric>
+prometheus::Family<Metric>& family(prometheus::detail::Builder<Metric> builder,
+                                   prometheus::Registry& registry, const char* name,
+                                   const char* help) {
+    return builder.Name(name).Help(help).Register(registry);
+}
+
+// A metric without labels: its family's one member.
+template <typename Metric>
+Metric& single(prometheus::detail::Builder<Metric> builder, prometheus::Registry& registry,
+               const char* name, const char* help) {
+    return family(builder, registry, name, help).Add({});
+}
+
 }  // namespace
 
 struct MetricsExporter::Impl : prometheus::Collectable {
     explicit Impl(std::function<ProcessReadings()> readingsSource)
         : source(std::move(readingsSource)),
           registry(std::make_shared<prometheus::Registry>()),
-          files(prometheus::BuildCounter()
-                    .Name("recorder_objects_total")
-                    .Help("Stream files done, by result: Success is stored, any other result "
-                          "names why the file was given up")
-                    .Register(*registry)),
-          bytes(prometheus::BuildCounter()
-                    .Name("recorder_stored_bytes_total")
-                    .Help("Bytes of the objects stored")
-                    .Register(*registry)
-                    .Add({})),
+          files(family(prometheus::BuildCounter(), *registry, "recorder_objects_total",
+                       "Stream files done, by result: Success is stored, any other result names "
+                       "why the file was given up")),
+          bytes(single(prometheus::BuildCounter(), *registry, "recorder_stored_bytes_total",
+                       "Bytes of the objects stored")),
           transferSeconds(
-              prometheus::BuildHistogram()
-                  .Name("recorder_transfer_seconds")
-                  .Help("Time the store took for one transfer attempt, whatever its "
-                        "result")
-                  .Register(*registry)
+              family(prometheus::BuildHistogram(), *registry, "recorder_transfer_seconds",
+                     "Time the store took for one transfer attempt, whatever its result")
                   .Add({}, prometheus::Histogram::BucketBoundaries{0.01, 0.025, 0.05, 0.1, 0.25,
                                                                    0.5, 1, 2.5, 5, 10, 30})),
-          attempts(prometheus::BuildCounter()
-                       .Name("recorder_transfer_attempts_total")
-                       .Help("Transfer attempts, by result")
-                       .Register(*registry)),
-          bufferMs(prometheus::BuildGauge()
-                       .Name("recorder_file_buffer_ms")
-                       .Help("Milliseconds of stream in finished files waiting for the store")
-                       .Register(*registry)
-                       .Add({})),
-          bufferLimitMs(prometheus::BuildGauge()
-                            .Name("recorder_file_buffer_limit_ms")
-                            .Help("File buffer level at which files are given up (BufferOver)")
-                            .Register(*registry)
-                            .Add({})),
-          overflows(prometheus::BuildCounter()
-                        .Name("recorder_queue_overflows_total")
-                        .Help("Samples dropped because the module's queue was full, by media")
-                        .Register(*registry)),
-          samples(prometheus::BuildCounter()
-                      .Name("recorder_samples_received_total")
-                      .Help("Samples handed to the module, by media")
-                      .Register(*registry)),
-          reopenings(prometheus::BuildCounter()
-                         .Name("recorder_input_reopenings_total")
-                         .Help("Times the live input was opened again after it failed or fell "
-                               "silent")
-                         .Register(*registry)
-                         .Add({})),
-          rebases(prometheus::BuildCounter()
-                      .Name("recorder_clock_rebases_total")
-                      .Help("Jumps of the source's clock re-based onto the recording's timeline")
-                      .Register(*registry)
-                      .Add({})),
-          captureTime(prometheus::BuildGauge()
-                          .Name("recorder_last_object_capture_time_seconds")
-                          .Help("Capture time of the first sample of the newest stored object, "
-                                "seconds since the epoch")
-                          .Register(*registry)
-                          .Add({})),
-          state(prometheus::BuildGauge()
-                    .Name("recorder_process_state")
-                    .Help("Process state: 1 Initializing, 2 Initialized, 3 Starting, 4 "
-                          "Executing, 5 Stopping, 6 Warning, 7 Error")
-                    .Register(*registry)
-                    .Add({})),
-          code(prometheus::BuildGauge()
-                   .Name("recorder_process_status_code")
-                   .Help("Code of the process state (the warning or error number; 0 none)")
-                   .Register(*registry)
-                   .Add({})) {
+          attempts(family(prometheus::BuildCounter(), *registry, "recorder_transfer_attempts_total",
+                          "Transfer attempts, by result")),
+          bufferMs(single(prometheus::BuildGauge(), *registry, "recorder_file_buffer_ms",
+                          "Milliseconds of stream in finished files waiting for the store")),
+          bufferLimitMs(single(prometheus::BuildGauge(), *registry, "recorder_file_buffer_limit_ms",
+                               "File buffer level at which files are given up (BufferOver)")),
+          overflows(family(prometheus::BuildCounter(), *registry, "recorder_queue_overflows_total",
+                           "Samples dropped because the module's queue was full, by media")),
+          samples(family(prometheus::BuildCounter(), *registry, "recorder_samples_received_total",
+                         "Samples handed to the module, by media")),
+          reopenings(single(prometheus::BuildCounter(), *registry,
+                            "recorder_input_reopenings_total",
+                            "Times the live input was opened again after it failed or fell "
+                            "silent")),
+          rebases(single(prometheus::BuildCounter(), *registry, "recorder_clock_rebases_total",
+                         "Jumps of the source's clock re-based onto the recording's timeline")),
+          captureTime(single(prometheus::BuildGauge(), *registry,
+                             "recorder_last_object_capture_time_seconds",
+                             "Capture time of the first sample of the newest stored object, "
+                             "seconds since the epoch")),
+          state(single(prometheus::BuildGauge(), *registry, "recorder_process_state",
+                       "Process state: 1 Initializing, 2 Initialized, 3 Starting, 4 Executing, 5 "
+                       "Stopping, 6 Warning, 7 Error")),
+          code(single(prometheus::BuildGauge(), *registry, "recorder_process_status_code",
+                      "Code of the process state (the warning or error number; 0 none)")) {
         for (int media = 0; media < ProcessReadings::kMediaCount; ++media) {
             overflowCounters[media] = &overflows.Add({{"media", kMediaNames[media]}});
             sampleCounters[media] = &samples.Add({{"media", kMediaNames[media]}});
