@@ -3,8 +3,10 @@
 // A full queue refuses the newest item: Push never blocks. A producer that would rather wait
 // than lose an item (a file input) asks WaitForRoom first; the consumer wakes it only once the
 // room it asked for is there, so a waiting producer wakes once per drained stretch, not once
-// per item. Pop blocks until an item is there. Clear filters the queue through the removal
-// predicate (true = remove). Every member takes the queue's own mutex; no callback but the
+// per item. Pop and PopAll block until an item is there; PopAll takes every queued item in one
+// lock, so a consumer handles a burst with one wake-up. A producer pushing a burst may push
+// without waking the consumer and call Wake once at the end. Clear filters the queue through the
+// removal predicate (true = remove). Every member takes the queue's own mutex; no callback but the
 // predicate runs under it.
 //
 // Each accepted item gets a ticket: 1 for the first Push, one more for each later one. Items
@@ -31,16 +33,27 @@ class BoundedQueue {
     BoundedQueue(const BoundedQueue&) = delete;
     BoundedQueue& operator=(const BoundedQueue&) = delete;
 
+    struct Entry {
+        T item;
+        uint64_t ticket;
+    };
+
     // True when appended; false when refused (full), the item is then released. `ticket`
-    // (optional) receives the item's ticket when appended.
-    bool Push(T item, uint64_t* ticket = nullptr) {
-        std::lock_guard<std::mutex> lock(mutex_);
-        if (items_.size() >= capacity_) return false;  // `item` is released when this frame ends
-        items_.push_back(Entry{std::move(item), ++lastTicket_});
-        if (ticket) *ticket = lastTicket_;
-        notEmpty_.notify_one();
+    // (optional) receives the item's ticket when appended. `wake` false leaves the consumer
+    // asleep: the producer then owes a Wake.
+    bool Push(T item, uint64_t* ticket = nullptr, bool wake = true) {
+        {
+            std::lock_guard<std::mutex> lock(mutex_);
+            if (items_.size() >= capacity_) return false;  // `item` is released at return
+            items_.push_back(Entry{std::move(item), ++lastTicket_});
+            if (ticket) *ticket = lastTicket_;
+        }
+        if (wake) notEmpty_.notify_one();
         return true;
     }
+
+    // Wakes the consumer for the items pushed without waking it.
+    void Wake() { notEmpty_.notify_one(); }
 
     // Blocks until an item is there, then takes the oldest; `ticket` (optional) receives its
     // ticket.
@@ -52,6 +65,15 @@ class BoundedQueue {
         wakeRoomWaiter();
         if (ticket) *ticket = entry.ticket;
         return std::move(entry.item);
+    }
+
+    // Blocks until an item is there, then moves every queued item, oldest first, into `out`
+    // (which the caller has emptied; its storage is reused).
+    void PopAll(std::deque<Entry>& out) {
+        std::unique_lock<std::mutex> lock(mutex_);
+        notEmpty_.wait(lock, [this] { return !items_.empty(); });
+        out.swap(items_);
+        wakeRoomWaiter();
     }
 
     // Removes the items the predicate selects; the others keep their order. An empty
@@ -113,10 +135,6 @@ class BoundedQueue {
         if (roomWanted_ != 0 && capacity_ - items_.size() >= roomWanted_) notFull_.notify_one();
     }
 
-    struct Entry {
-        T item;
-        uint64_t ticket;
-    };
     std::deque<Entry> items_;  // oldest at the front
     const uint64_t capacity_;
     uint64_t roomWanted_ = 0;  // room the waiting producer asked for; 0: nobody waits

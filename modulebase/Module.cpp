@@ -24,7 +24,8 @@ void Module::push(Media media, std::shared_ptr<StreamData> sample) {
         "queue overflow (video)", "queue overflow (audio)", "queue overflow (meta)"};
     Lane& lane = lanes_[media];
     lane.received.fetch_add(1, std::memory_order_relaxed);
-    if (lane.queue.Push(std::move(sample))) return;
+    if (lane.queue.Push(std::move(sample), nullptr, !burstOpen_.load(std::memory_order_relaxed)))
+        return;
     lane.overflows.fetch_add(1, std::memory_order_relaxed);
     Logger::Put(5, nullptr, nullptr, 0, "%s", kOverflowLines[media]);
 }
@@ -54,6 +55,15 @@ void Module::FlushQueues() {
         lane.markerHandled.wait(
             lock, [&] { return lane.markerTicket >= ticket || !lane.running.load(); });
     }
+}
+
+void Module::BeginBurst() {
+    burstOpen_.store(true, std::memory_order_relaxed);
+}
+
+void Module::EndBurst() {
+    burstOpen_.store(false, std::memory_order_relaxed);
+    for (Lane& lane : lanes_) lane.queue.Wake();
 }
 
 void Module::ClearQueues() {
@@ -126,16 +136,19 @@ void Module::process(Media media, std::shared_ptr<StreamData> sample) {
 
 void Module::workerLoop(Media media) {
     Lane& lane = lanes_[media];
+    std::deque<Queue::Entry> taken;  // one PopAll's items; its storage is reused
     while (true) {
-        uint64_t ticket = 0;
-        std::shared_ptr<StreamData> item = lane.queue.Pop(&ticket);
-        if (item && item->payloadSize > 0) {
-            process(media, std::move(item));
-        } else {
-            std::lock_guard<std::mutex> lock(markerMutex_);
-            lane.markerTicket = ticket;
-            lane.markerHandled.notify_all();
+        lane.queue.PopAll(taken);
+        for (Queue::Entry& entry : taken) {
+            if (entry.item && entry.item->payloadSize > 0) {
+                process(media, std::move(entry.item));
+            } else {
+                std::lock_guard<std::mutex> lock(markerMutex_);
+                lane.markerTicket = entry.ticket;
+                lane.markerHandled.notify_all();
+            }
+            if (!lane.running.load()) return;  // what is left was queued before the stop
         }
-        if (!lane.running.load()) break;
+        taken.clear();
     }
 }

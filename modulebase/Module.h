@@ -5,9 +5,10 @@
 // sample with one "queue overflow (...)" line. That suits a live input, where waiting would only
 // move the loss into the socket; an input that can wait (a file) asks WaitForRoom before it
 // pushes and so never loses a sample. Every push is counted per media (one relaxed atomic
-// increment, and one more when the queue was full), for monitoring. Each worker pops its queue
-// in order and calls the derived class's Process* hook; no Module lock is held while a hook runs,
-// so the three hooks run concurrently and the derived class synchronises what they share.
+// increment, and one more when the queue was full), for monitoring. Each worker takes everything
+// queued in one go and calls the derived class's Process* hook for each sample in order; no Module
+// lock is held while a hook runs, so the three hooks run concurrently and the derived class
+// synchronises what they share.
 //
 // Shutdown and flushing use marker samples (payloadSize 0), which never reach the hooks.
 // StartThreads/StopThreads/FlushQueues are called from one controlling thread, never from a
@@ -39,6 +40,10 @@ class Module : public ModuleInterface {
     // it (an earlier flush or stop does not satisfy a later one). A queue whose worker is not
     // running is not waited for.
     void FlushQueues() override;
+    // Between BeginBurst and EndBurst, pushes from the calling producer do not wake the
+    // workers; EndBurst wakes each once. Called by the one producer thread that pushes.
+    void BeginBurst() override;
+    void EndBurst() override;
     // Removes every queued real sample; markers stay.
     void ClearQueues() override;
     // Blocks until the video, audio and meta queues have room for `video`, `audio` and `meta`
@@ -89,5 +94,6 @@ class Module : public ModuleInterface {
     void process(Media media, std::shared_ptr<StreamData> sample);
 
     Lane lanes_[kMediaCount]{Lane(50), Lane(20), Lane(20)};
-    std::mutex markerMutex_;  // guards every lane's markerTicket
+    std::mutex markerMutex_;              // guards every lane's markerTicket
+    std::atomic<bool> burstOpen_{false};  // pushes leave the workers asleep; relaxed
 };

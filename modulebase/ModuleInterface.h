@@ -15,6 +15,10 @@ class ModuleInterface {
     virtual void PushVideo(std::shared_ptr<StreamData> sample) = 0;
     virtual void PushAudio(std::shared_ptr<StreamData> sample) = 0;
     virtual void PushMeta(std::shared_ptr<StreamData> sample) = 0;
+    // A producer handing over several samples at once brackets them so the workers wake once
+    // per burst rather than once per sample.
+    virtual void BeginBurst() = 0;
+    virtual void EndBurst() = 0;
     virtual ~ModuleInterface() = default;
     virtual void Restart() = 0;
     // Waits until every worker has handled everything queued before the call.

@@ -187,6 +187,15 @@ bool ProcessControl::waitForSampleRoom(size_t video, size_t audio, size_t meta,
     return module_->WaitForRoom(video, audio, meta, deadline);
 }
 
+// module_ is replaced only by initializeProcess, before the receive thread starts.
+void ProcessControl::beginSampleBurst() {
+    if (module_) module_->BeginBurst();
+}
+
+void ProcessControl::endSampleBurst() {
+    if (module_) module_->EndBurst();
+}
+
 void ProcessControl::notifyVideoData(std::shared_ptr<ReceivedSample> sample) {
     auto data = std::make_shared<StreamData>(std::move(sample));
     if (running_.load()) module_->PushVideo(std::move(data));

@@ -49,6 +49,8 @@ class ProcessControl : public BaseProcess, public INotifyObserver {
     // The module's queues have room (or the module no longer runs and drops samples anyway).
     bool waitForSampleRoom(size_t video, size_t audio, size_t meta,
                            std::chrono::steady_clock::time_point deadline) override;
+    void beginSampleBurst() override;
+    void endSampleBurst() override;
     void notifyVideoData(std::shared_ptr<ReceivedSample> sample) override;
     void notifyAudioData(std::shared_ptr<ReceivedSample> sample) override;
     void notifyMetaData(std::shared_ptr<ReceivedSample> sample) override;

@@ -149,6 +149,12 @@ class BaseProcess : public IVqModuleMessageObserver,
     virtual bool waitForSampleRoom(size_t video, size_t audio, size_t meta,
                                    std::chrono::steady_clock::time_point deadline);
 
+    // Receive thread: the samples handed over between these two calls come as one burst, so
+    // the module may wake its workers once, at the end, rather than per sample. Every begin is
+    // followed by an end. The base does nothing.
+    virtual void beginSampleBurst() {}
+    virtual void endSampleBurst() {}
+
     // Adds what the module counts (queues, file buffer) to `readings`. Any thread, concurrently
     // with every other hook, after Initialize; must not block. The base counts nothing.
     virtual void moduleReadings(ProcessReadings& readings);

@@ -266,8 +266,10 @@ bool MediaHost::handOn(BaseProcess& process, Pacer& pacer, Batch& batch,
 }
 
 void MediaHost::flush(BaseProcess& process, Batch& batch) {
-    if (live_ || batch.empty() || waitForRoom(process, batch)) {
+    if (!batch.empty() && (live_ || waitForRoom(process, batch))) {
+        process.beginSampleBurst();
         for (const auto& [p, t] : batch) deliver(process, p, t);
+        process.endSampleBurst();
     }
     batch.clear();
 }

@@ -3,9 +3,11 @@
 // The receive thread calls Pace with each packet's decode time on the shared clock before it
 // hands the packet over; Pace blocks (a timed wait, no polling) until the wall clock has caught
 // up with that time divided by the rate. The first packet sets the start. To keep wake-ups few
-// (each costs a futex round trip), a packet that is due soon goes at once: the input runs
-// ahead of its schedule by at most kSlack of wall-clock time and at most kMediaSlack of media
-// time (at high rates the latter bounds the bursts that the module's queues must absorb).
+// (each costs a futex round trip on this thread and on the workers it feeds), packets go in
+// bursts: a packet due within the slack goes at once, and a packet that is not waits until it
+// is due, so each wake-up opens a burst of one slack's worth. The input thus runs ahead of its
+// schedule by at most kSlack of wall-clock time and at most kMediaSlack of media time (at high
+// rates the latter bounds the bursts that the module's queues must absorb).
 //
 // Threads: one thread (the receive thread) calls Pace; the StopSignal may be raised from any
 // thread and ends a wait at once.
@@ -18,7 +20,7 @@
 
 class Pacer {
   public:
-    static constexpr std::chrono::milliseconds kSlack{20};
+    static constexpr std::chrono::milliseconds kSlack{100};
     static constexpr std::chrono::milliseconds kMediaSlack{200};
 
     // `rate` <= 0: no pacing (Pace returns at once unless stopped).
