@@ -37,6 +37,7 @@ uint64_t FileBuffer::FilesPushed() {
 VqStreamFileData FileBuffer::Pop() {
     VqStreamFileData record = queue_.Pop();
     bufferCount_.fetch_sub(record.duration);
+    if (popHook_) popHook_();
     return record;
 }
 

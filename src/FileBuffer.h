@@ -15,6 +15,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <functional>
 
 #include "modulebase/BoundedQueue.h"
 #include "src/IFileBuffer.h"
@@ -41,6 +42,9 @@ class FileBuffer : public IFileBuffer {
     uint64_t GetBufferCount() override;
     uint64_t FilesPushed() override;
     uint64_t LimitMs() override { return bufferFullSize_; }
+    // `hook` runs on the popping thread after each Pop, outside the queue's lock (the count
+    // has dropped). Set before the first Pop.
+    void SetPopHook(std::function<void()> hook) { popHook_ = std::move(hook); }
 
   private:
     static constexpr uint64_t kCapacity = 2147483647;   // records; in practice unbounded
@@ -50,6 +54,7 @@ class FileBuffer : public IFileBuffer {
     const uint64_t bufferFullSize_;         // ms
     std::atomic<uint64_t> bufferCount_{0};  // ms, sum of the queued durations
     std::atomic<uint64_t> filesPushed_{0};  // non-empty records queued so far
+    std::function<void()> popHook_;
 };
 
 }  // namespace Orvane

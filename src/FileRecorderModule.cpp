@@ -88,12 +88,14 @@ void FileRecorderModule::Connect(ProcessControl* processControl, ModuleSettings 
         static_cast<int32_t>(static_cast<uint32_t>(settings_.bufferFullSize) *
                              static_cast<uint32_t>(settings_.uploadInterval) * 1000u);
     auto fileBuffer = std::make_shared<FileBuffer>(fullSize);
+    fileBuffer->SetPopHook([this] { backlogShrank(); });
     auto transfer = transferFactory_ ? transferFactory_() : VqStreamFileTransfer::CreateInterface();
     auto dataUploader = std::make_shared<DataUploader>(std::move(transfer));
     int codecType = static_cast<int>(settings_.codecType);
     auto nalAnalyzer = std::make_shared<NalAnalyzer>(codecType);
     auto streamBuffer =
         std::make_shared<StreamBuffer>(observer, fileBuffer, timeManager, nalAnalyzer, settings_);
+    streamBuffer->SetTickHook([this] { backlogShrank(); });
     auto dataController = std::make_shared<DataController>(observer, fileBuffer, timeManager,
                                                            dataUploader, settings_);
     std::optional<AwsInfo> pending;
@@ -105,6 +107,7 @@ void FileRecorderModule::Connect(ProcessControl* processControl, ModuleSettings 
         nalAnalyzer_ = nalAnalyzer;
         streamBuffer_ = streamBuffer;
         dataController_ = dataController;
+        intervalMs_ = static_cast<uint64_t>(std::max(settings_.uploadInterval, 1)) * 1000;
         pending.swap(pendingAwsInfo_);
     }
     if (pending) dataController->SetAwsInfo(*pending);
@@ -182,6 +185,54 @@ FileRecorderModule::DrainResult FileRecorderModule::Drain(
         result.droppedMs = controller->PendingMs();
     }
     return result;
+}
+
+bool FileRecorderModule::WaitForBacklog(std::chrono::steady_clock::time_point deadline) {
+    std::shared_ptr<IStreamBuffer> buffer;
+    std::shared_ptr<IFileBuffer> fileBuffer;
+    std::shared_ptr<IDataController> controller;
+    uint64_t intervalMs;
+    {
+        std::lock_guard<std::mutex> lock(componentsMutex_);
+        buffer = streamBuffer_;
+        fileBuffer = fileBuffer_;
+        controller = dataController_;
+        intervalMs = intervalMs_;
+    }
+    if (!buffer || !fileBuffer || !controller) return true;
+    // Filing gives everything held up at ten intervals of span (StreamFiling.cpp); the upload
+    // loop gives files up while the file buffer holds its limit when a transfer ends. What is
+    // held and not yet stored (span + buffer + the file in transfer) is kept below the limit
+    // plus half an interval: when the file in transfer is done the buffer is below its limit.
+    const uint64_t spanLimitMs = intervalMs * 10 / 2;
+    const uint64_t fileLimitMs = fileBuffer->LimitMs();
+    const uint64_t pendingLimitMs = fileLimitMs + intervalMs / 2;
+    const auto now = std::chrono::steady_clock::now();
+    // With no file waiting or in transfer, only filing can shrink the backlog; a span it cannot
+    // cut (no IDR) is waited for at most kMaxFilingWait: the stream buffer's own overflow
+    // handling then applies, rather than reading stalling. A store that lags is waited for.
+    const bool filingWaitOver = filingWaitSince_ && now - *filingWaitSince_ > kMaxFilingWait;
+    bool filingBlocked = false;
+    std::unique_lock<std::mutex> lock(backlogMutex_);
+    const bool roomy = backlogCondition_.wait_until(lock, deadline, [&] {
+        const uint64_t span = buffer->HeldSpanMs();
+        const uint64_t pending = controller->PendingMs();
+        const bool blocked =
+            span >= spanLimitMs || (fileLimitMs != 0 && span + pending >= pendingLimitMs);
+        filingBlocked = blocked && pending == 0;
+        return !blocked || (filingBlocked && filingWaitOver);
+    });
+    if (!filingBlocked) {
+        filingWaitSince_.reset();
+    } else if (!filingWaitSince_) {
+        filingWaitSince_ = now;
+    }
+    return roomy;
+}
+
+void FileRecorderModule::backlogShrank() {
+    { std::lock_guard<std::mutex> lock(backlogMutex_); }
+    backlogCondition_.notify_all();
 }
 
 void FileRecorderModule::FileBufferLevel(uint64_t* levelMs, uint64_t* limitMs) const {

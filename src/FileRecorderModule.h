@@ -13,6 +13,7 @@
 #include <boost/thread/condition_variable.hpp>
 #include <boost/thread/mutex.hpp>
 #include <chrono>
+#include <condition_variable>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -65,6 +66,14 @@ class FileRecorderModule : public Module {
     // drain then ends at once, incomplete.
     DrainResult Drain(std::chrono::steady_clock::time_point deadline);
 
+    // Flow control for an input that can wait (receive thread, after the queues had room):
+    // blocks while the recorder holds more stream than it can keep without giving any up:
+    // half the span at which filing drops everything held ("input buffer overflow"), or so
+    // much unstored stream that the file buffer would reach its limit (files given up as
+    // BufferOver). Woken by the filing thread's ticks and the upload thread's pops. True when below
+    // both; false at `deadline`. Without a connected pipeline there is nothing to wait for.
+    bool WaitForBacklog(std::chrono::steady_clock::time_point deadline);
+
     // The file buffer's level and limit in ms, for monitoring; both 0 before Connect. Any thread.
     void FileBufferLevel(uint64_t* levelMs, uint64_t* limitMs) const;
 
@@ -101,7 +110,17 @@ class FileRecorderModule : public Module {
     mutable std::mutex componentsMutex_;     // guards the component pointers and pendingAwsInfo_
     std::optional<AwsInfo> pendingAwsInfo_;  // credentials that came before Connect
     bool connected_ = false;                 // between Connect and Disconnect (message thread)
+    uint64_t intervalMs_ = 0;                // the upload interval, ms; componentsMutex_
     std::function<std::shared_ptr<IFileTransfer>()> transferFactory_;
+
+    // The held stream may have shrunk (filing and upload threads).
+    void backlogShrank();
+    std::mutex backlogMutex_;  // WaitForBacklog's wait; orders its check against the wake-ups
+    std::condition_variable backlogCondition_;
+    static constexpr std::chrono::seconds kMaxFilingWait{10};
+    // Since when WaitForBacklog has found a backlog that only filing could shrink; receive
+    // thread only.
+    std::optional<std::chrono::steady_clock::time_point> filingWaitSince_;
 };
 
 }  // namespace Orvane

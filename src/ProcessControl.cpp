@@ -184,7 +184,7 @@ bool ProcessControl::drainProcess(int64_t timeoutMs) {
 bool ProcessControl::waitForSampleRoom(size_t video, size_t audio, size_t meta,
                                        std::chrono::steady_clock::time_point deadline) {
     if (!running_.load()) return true;
-    return module_->WaitForRoom(video, audio, meta, deadline);
+    return module_->WaitForRoom(video, audio, meta, deadline) && module_->WaitForBacklog(deadline);
 }
 
 // module_ is replaced only by initializeProcess, before the receive thread starts.

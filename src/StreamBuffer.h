@@ -77,6 +77,8 @@ class StreamBuffer : public IStreamBuffer {
     void ReceiveMetaBeforeStart(std::shared_ptr<StreamData> sample) override;
     // Under the filing mutex, so never in the middle of a tick (StreamBufferDrain.cpp).
     void CutRemaining() override;
+    uint64_t HeldSpanMs() override { return heldSpan(); }
+    void SetTickHook(std::function<void()> hook) override { tickHook_ = std::move(hook); }
 
   private:
     friend class StreamBufferProbe;
@@ -132,6 +134,7 @@ class StreamBuffer : public IStreamBuffer {
     // Collaborators, fixed at construction.
     INotifyObserver* const observer_;  // not owned, may be null
     const std::shared_ptr<IFileBuffer> fileBuffer_;
+    std::function<void()> tickHook_;  // run after every tick (SetTickHook, before Start)
     const std::shared_ptr<ITimeManager> timeManager_;
     const std::shared_ptr<INalAnalyzer> nalAnalyzer_;
     const ModuleSettings settings_;

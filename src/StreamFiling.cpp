@@ -66,6 +66,8 @@ void StreamBuffer::createStreamFile() {
             filing();
             catchUp();
         }
+        lock.unlock();
+        if (tickHook_) tickHook_();
         workTime = timeManager_->GetTime() - now;
     }
 }

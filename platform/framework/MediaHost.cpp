@@ -248,20 +248,20 @@ bool MediaHost::readingEnds(MediaInput::Status status, const std::string& error)
     return false;
 }
 
-bool MediaHost::handOn(BaseProcess& process, Pacer& pacer, Batch& batch,
-                       const MediaInput::Packet& packet, const SampleClock::Times& times) {
+bool MediaHost::handOn(BaseProcess& process, Pacer& pacer, Batch& batch, MediaInput::Packet& packet,
+                       const SampleClock::Times& times) {
     if (live_) {
         deliver(process, packet, times);  // a live input is not paced and cannot wait
         return true;
     }
     if (!pacer.Paced()) {
-        batch.emplace_back(packet, times);
+        batch.emplace_back(std::move(packet), times);
         if (batch.size() >= kMaxBatch) flush(process, batch);
         return true;
     }
     if (!pacer.IsDue(times.dtsUs) || batch.size() >= kMaxBatch) flush(process, batch);
     if (!pacer.Pace(times.dtsUs)) return false;
-    batch.emplace_back(packet, times);
+    batch.emplace_back(std::move(packet), times);
     return true;
 }
 
@@ -278,10 +278,12 @@ bool MediaHost::waitForRoom(BaseProcess& process, const Batch& batch) {
     size_t counts[SampleClock::kTrackCount] = {0, 0, 0};
     for (const auto& entry : batch) ++counts[entry.first.track];
     while (!stop_.Raised()) {
+        const auto deadline = std::chrono::steady_clock::now() + kRoomWaitSlice;
         if (process.waitForSampleRoom(counts[SampleClock::kVideo], counts[SampleClock::kAudio],
-                                      counts[SampleClock::kMeta],
-                                      std::chrono::steady_clock::now() + kRoomWaitSlice))
+                                      counts[SampleClock::kMeta], deadline))
             return true;
+        // A module whose workers are being restarted refuses at once: no spinning meanwhile.
+        if (stop_.WaitUntil(deadline)) return false;
     }
     return false;
 }
