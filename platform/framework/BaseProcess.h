@@ -10,7 +10,7 @@
 //   Execute()    startProcess, then the host's Run (connection reply, credentials, samples),
 //                then the disconnection request and stopProcess;
 //   Uninitialize().
-// Outcome() then tells how the run ended, as the process's exit status.
+// RunOutcome() then tells how the run ended, as the process's exit status.
 // Hooks are virtual and public so that a host (and a test) can deliver messages. The sample
 // hooks are called on the host's receive threads, concurrently with the message hooks.
 // Status and send calls are safe for concurrent callers.

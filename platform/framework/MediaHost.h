@@ -92,9 +92,9 @@ class MediaHost : public IModuleHost {
     // before each burst and so never loses a sample; a stop during that wait discards the
     // burst as if it had not been read. A live input is handed over packet by packet.
     using Batch = std::vector<std::pair<MediaInput::Packet, SampleClock::Times>>;
-    // Receive thread: delivers the packet or adds it to the burst; false when a stop ended
+    // Receive thread: delivers the packet or moves it into the burst; false when a stop ended
     // the pacer's wait.
-    bool handOn(BaseProcess& process, Pacer& pacer, Batch& batch, const MediaInput::Packet& packet,
+    bool handOn(BaseProcess& process, Pacer& pacer, Batch& batch, MediaInput::Packet& packet,
                 const SampleClock::Times& times);
     // Receive thread: delivers the burst (after waiting for room, for a file) and empties it.
     void flush(BaseProcess& process, Batch& batch);

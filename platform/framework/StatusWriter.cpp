@@ -7,6 +7,7 @@
 #include <ctime>
 #include <nlohmann/json.hpp>
 
+#include "platform/logger/Logger.h"
 #include "platform/transfer/UtcTime.h"
 
 namespace {
@@ -32,9 +33,7 @@ bool StatusWriter::Open(const std::string& path) {
         ownsFile_ = false;
         return true;
     }
-    // Never through a symbolic link at the last component, and readable by the group only:
-    // the messages name the stream and its objects.
-    int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NOFOLLOW, 0640);
+    int fd = Logger::OpenAppend(path);
     if (fd < 0) return false;
     FILE* f = fdopen(fd, "a");
     if (f == nullptr) {

@@ -55,7 +55,6 @@ void TokenResponder::run() {
             return stopped_ || !answered_;
         }) && stopped_;
         if (stopped) return;
-        if (answered_ && Clock::now() < lastAnswer_ + delay_) continue;  // spurious wake-up
         pending_ = false;
         if (answered_) delay_ = std::min(delay_ * 2, longest_);
         answered_ = true;

@@ -1,8 +1,8 @@
 // LineCondenser: keeps a fault that repeats from flooding the log. Of identical failure and
 // warning lines, the first is written; repeats within the window that it opened are counted
 // instead; the first repeat after the window is written with the count of those it stood for
-// ("... (and 1234 more like it in 30 s)"), and opens the next window. A storm of one line thus
-// writes one line per window, however fast it comes.
+// ("... (and 1234 more like it in the last 30 s)"), and opens the next window. A storm of one line
+// thus writes one line per window, however fast it comes.
 //
 // It never waits and keeps no timer: a count is written with the next repeat, so the count of
 // a storm's last window is not written at all. Lines are told apart by their whole key (the

@@ -134,8 +134,14 @@ bool Logger::Enabled(int priority) {
     return priority <= g_level.load(std::memory_order_relaxed);
 }
 
+int Logger::OpenAppend(const std::string& path) {
+    const bool systemLink = path.rfind("/dev/", 0) == 0 || path.rfind("/proc/self/fd/", 0) == 0;
+    const int flags = O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | (systemLink ? 0 : O_NOFOLLOW);
+    return open(path.c_str(), flags, 0640);
+}
+
 bool Logger::SetFile(const std::string& path) {
-    const int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NOFOLLOW, 0640);
+    const int fd = OpenAppend(path);
     if (fd < 0) return false;
     auto sink = std::make_shared<DescriptorSink>(fd);
     std::lock_guard<std::mutex> lock(g_changeMutex);

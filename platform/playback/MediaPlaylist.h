@@ -42,7 +42,6 @@ class MediaPlaylist {
         closed_ = true;
     }
 
-    bool Closed() const { return closed_; }
     bool Empty() const { return entries_.empty(); }
     const std::vector<PlaylistEntry>& Entries() const { return entries_; }
 
