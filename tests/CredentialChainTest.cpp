@@ -13,13 +13,11 @@
 #include "platform/framework/HostCredentials.h"
 #include "tests/support/AwsStandIns.h"
 #include "tests/support/LogCapture.h"
-#include "tests/support/ScriptedHttpServer.h"
 #include "tests/support/TestSupport.h"
 
 using namespace awsauth;
 using namespace std::chrono;
-using testsupport::FormValue;
-using testsupport::ScriptedHttpServer;
+using namespace testsupport;
 
 namespace {
 
@@ -135,27 +133,26 @@ TEST(CredentialChainTest, KeepsCredentialsUntilFiveMinutesBeforeTheyExpire) {
 // before they expire. Then nothing at all: every source absent quickly, each named.
 TEST(HostCredentialsConcurrencyTest, WholeChainFromAStaticKeyProfileWithRenewal) {
     std::atomic<int> issued{0};
-    ScriptedHttpServer sts([&](const testsupport::HttpRequestSeen& request) {
+    ScriptedHttpServer sts([&](const HttpRequestSeen& request) {
         // 5 minutes and 1 s to live: due for renewal a second after being issued.
-        return testsupport::StsCredentialsAnswer(
-            FormValue(request.body, "Action"), "ASIA" + std::to_string(++issued), "tmp-secret",
-            "tmp-token", system_clock::now() + minutes(5) + seconds(1));
+        return StsCredentialsAnswer(FormValue(request.body, "Action"),
+                                    "ASIA" + std::to_string(++issued), "tmp-secret", "tmp-token",
+                                    system_clock::now() + minutes(5) + seconds(1));
     });
     ScriptedHttpServer imds(ScriptedHttpServer::Mode::kStall);
-    const std::string dir = testsupport::ScratchDir("hostcredentials");
+    const std::string dir = ScratchDir("hostcredentials");
     std::map<std::string, std::string> variables = {
         {"HOME", dir + "/home"},
-        {"AWS_SHARED_CREDENTIALS_FILE",
-         testsupport::WriteFile(dir + "/credentials",
-                                "[default]\naws_access_key_id = AKIAUSER\n"
-                                "aws_secret_access_key = user-secret\n")},
+        {"AWS_SHARED_CREDENTIALS_FILE", WriteFile(dir + "/credentials",
+                                                  "[default]\naws_access_key_id = AKIAUSER\n"
+                                                  "aws_secret_access_key = user-secret\n")},
         {"AWS_ENDPOINT_URL_STS", sts.Endpoint()},
         {"AWS_EC2_METADATA_SERVICE_ENDPOINT", imds.Endpoint()}};
     FrameworkOptions options;
     options.region = "eu-west-1";
     LogCapture capture;
     {
-        HostCredentials host(options, testsupport::EnvOf(variables));
+        HostCredentials host(options, EnvOf(variables));
         credentials::Result first = host.Fetch(false);
         ASSERT_TRUE(first.ok) << first.why;
         EXPECT_EQ(first.source, "shared config files via STS GetSessionToken");
@@ -174,7 +171,7 @@ TEST(HostCredentialsConcurrencyTest, WholeChainFromAStaticKeyProfileWithRenewal)
             std::lock_guard<std::mutex> lock(mutex);
             renewed.push_back(result.properties.at("awsAccessKey"));
         });
-        ASSERT_TRUE(testsupport::WaitUntil(
+        ASSERT_TRUE(WaitUntil(
             [&] {
                 std::lock_guard<std::mutex> lock(mutex);
                 return renewed.size() >= 2;
@@ -191,19 +188,18 @@ TEST(HostCredentialsConcurrencyTest, WholeChainFromAStaticKeyProfileWithRenewal)
 
     variables.erase("AWS_SHARED_CREDENTIALS_FILE");
     const auto started = steady_clock::now();
-    credentials::Result none = HostCredentials(options, testsupport::EnvOf(variables)).Fetch(false);
+    credentials::Result none = HostCredentials(options, EnvOf(variables)).Fetch(false);
     EXPECT_LT(steady_clock::now() - started, seconds(5));
     EXPECT_FALSE(none.ok);
     for (const char* source : {"environment: ", "web identity: ", "shared config files: ",
-                               "container endpoint: ", "instance metadata: "}) {
+                               "container endpoint: ", "instance metadata: "})
         EXPECT_NE(none.why.find(source), std::string::npos) << none.why;
-    }
 }
 
 // A credential process is asked again on every refreshing fetch, never cached; long-term keys
 // that STS does not exchange (none answers here) pass on to the next source, the environment.
 TEST(HostCredentialsTest, CredentialProcessThenTheEnvironment) {
-    const std::string counter = testsupport::ScratchDir("hostprocess") + "/count";
+    const std::string counter = ScratchDir("hostprocess") + "/count";
     FrameworkOptions options;
     options.region = "eu-west-3";
     options.credentialProcess =
@@ -216,7 +212,7 @@ TEST(HostCredentialsTest, CredentialProcessThenTheEnvironment) {
                                                     {"AWS_ACCESS_KEY_ID", "AKIDENV"},
                                                     {"AWS_SECRET_ACCESS_KEY", "envsecret"}};
     LogCapture capture;
-    HostCredentials process(options, testsupport::EnvOf(variables));
+    HostCredentials process(options, EnvOf(variables));
     EXPECT_EQ(process.Fetch(false).properties.at("awsAccessKey"), "AKID1");
     const credentials::Result again = process.Fetch(true);
     EXPECT_EQ(again.properties.at("awsAccessKey"), "AKID2");
@@ -226,15 +222,13 @@ TEST(HostCredentialsTest, CredentialProcessThenTheEnvironment) {
     EXPECT_EQ(capture.CountContaining("s3cr3t"), 0u);
 
     options.credentialProcess = "echo '{\"AccessKeyId\":\"a\",\"SecretAccessKey\":\"b\"}'";
-    const credentials::Result none =
-        HostCredentials(options, testsupport::EnvOf(variables)).Fetch(false);
+    const credentials::Result none = HostCredentials(options, EnvOf(variables)).Fetch(false);
     EXPECT_FALSE(none.ok);
     EXPECT_NE(none.why.find("credential process: long-term keys not exchanged"), std::string::npos)
         << none.why;
     EXPECT_NE(none.why.find("environment: long-term keys not exchanged"), std::string::npos);
     variables["AWS_SESSION_TOKEN"] = "envtoken";
-    const credentials::Result env =
-        HostCredentials(options, testsupport::EnvOf(variables)).Fetch(false);
+    const credentials::Result env = HostCredentials(options, EnvOf(variables)).Fetch(false);
     ASSERT_TRUE(env.ok) << env.why;
     EXPECT_EQ(env.properties.at("awsAccessKey"), "AKIDENV");
     EXPECT_EQ(env.properties.at("sessionToken"), "envtoken");
