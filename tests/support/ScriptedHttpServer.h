@@ -26,10 +26,8 @@ namespace testsupport {
 
 // One request as the server read it.
 struct HttpRequestSeen {
-    std::string raw;     // header block and body, as received
-    std::string method;  // "PUT", "GET", ...
-    std::string target;  // path and query, as sent
-    std::string body;
+    std::string raw;                   // header block and body, as received
+    std::string method, target, body;  // target: path and query, as sent
     // The value of the first header `name` (any letter case), "" when absent.
     std::string Header(const std::string& name) const {
         const size_t headEnd = raw.find("\r\n\r\n");
@@ -69,10 +67,6 @@ class ScriptedHttpServer {
     int Port() const { return port_; }
     std::string Endpoint() const { return "http://127.0.0.1:" + std::to_string(port_); }
     int Connections() const { return connections_.load(); }
-    std::string Request() const {  // the last request read, headers and body
-        std::lock_guard<std::mutex> lock(mutex_);
-        return requests_.empty() ? std::string() : requests_.back().raw;
-    }
     std::vector<HttpRequestSeen> Requests() const {  // every request read, in order
         std::lock_guard<std::mutex> lock(mutex_);
         return requests_;
