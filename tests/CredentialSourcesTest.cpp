@@ -7,6 +7,8 @@
 // again; AWS_CA_BUNDLE not trusted, or trust without it, by the sources' client and the S3 store.
 #include <gtest/gtest.h>
 
+#include <atomic>
+
 #include "platform/awsauth/ContainerCredentials.h"
 #include "platform/awsauth/HttpClient.h"
 #include "platform/awsauth/InstanceMetadata.h"
@@ -98,7 +100,7 @@ TEST(ContainerCredentialsTest, AsksWithTheAuthorizationTokenOfTheMoment) {
 // each later request carrying the token. Off EC2 (nothing answers, or something accepts and
 // never answers) the source is absent within about its 1 s bound.
 TEST(InstanceMetadataTest, FetchesWithASessionTokenAndFallsThroughQuicklyWhenAbsent) {
-    bool roleAttached = true;
+    std::atomic<bool> roleAttached{true};  // read on the server thread
     const std::string roles = "/latest/meta-data/iam/security-credentials/";
     ScriptedHttpServer imds([&](const HttpRequestSeen& request) {
         if (request.method == "PUT" && request.target == "/latest/api/token")
