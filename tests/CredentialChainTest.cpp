@@ -3,7 +3,7 @@
 // gave credentials; long-term keys handed out unexchanged, or a refused exchange that ends the
 // chain; credentials not renewed 5 minutes before they expire (or at half a short life), dropped
 // while they still work, or kept past expiry; a secret in the log; the renewal thread not handing
-// over fresh credentials; a credential process answer cached; an absent source that is slow.
+// over fresh credentials; an absent source that is slow.
 #include <gtest/gtest.h>
 
 #include <atomic>
@@ -158,11 +158,7 @@ TEST(HostCredentialsConcurrencyTest, WholeChainFromAStaticKeyProfileWithRenewal)
         ASSERT_TRUE(first.ok) << first.why;
         EXPECT_EQ(first.source, "shared config files via STS GetSessionToken");
         EXPECT_EQ(first.properties.at("awsAccessKey"), "ASIA1");
-        EXPECT_EQ(first.properties.at("sessionToken"), "tmp-token");
-        const auto requests = sts.Requests();
-        ASSERT_EQ(requests.size(), 1u);
-        EXPECT_EQ(FormValue(requests[0].body, "Action"), "GetSessionToken");
-        EXPECT_NE(requests[0].Header("Authorization").find("Credential=AKIAUSER/"),
+        EXPECT_NE(sts.Requests().at(0).Header("Authorization").find("Credential=AKIAUSER/"),
                   std::string::npos);
 
         std::mutex mutex;
@@ -194,31 +190,18 @@ TEST(HostCredentialsConcurrencyTest, WholeChainFromAStaticKeyProfileWithRenewal)
         EXPECT_NE(none.why.find(source), std::string::npos) << none.why;
 }
 
-// A credential process is asked again on every refreshing fetch, never cached; long-term keys
-// that STS does not exchange (none answers here) pass on to the next source, the environment.
+// Long-term keys that STS does not exchange (none answers here), from a credential process or
+// the environment, pass on to the next source. (That a credential process is asked again, never
+// cached, EndToEndTest.ToS3rverWithCredentialsFromACredentialProcess shows.)
 TEST(HostCredentialsTest, CredentialProcessThenTheEnvironment) {
-    const std::string counter = ScratchDir("hostprocess") + "/count";
     FrameworkOptions options;
     options.region = "eu-west-3";
-    options.credentialProcess =
-        "echo x >> " + counter + "; printf '{\"Version\":1,\"AccessKeyId\":" +
-        "\"AKID%s\",\"SecretAccessKey\":\"s3cr3t\",\"SessionToken\":\"tok\"}'" + " $(wc -l < " +
-        counter + ")";
+    options.credentialProcess = "echo '{\"AccessKeyId\":\"a\",\"SecretAccessKey\":\"b\"}'";
     Variables variables = {{"AWS_ENDPOINT_URL_STS", "http://127.0.0.1:9"},
                            {"HOME", "/nonexistent"},
                            {"AWS_EC2_METADATA_DISABLED", "true"},
                            {"AWS_ACCESS_KEY_ID", "AKIDENV"},
                            {"AWS_SECRET_ACCESS_KEY", "envsecret"}};
-    LogCapture capture;
-    HostCredentials process(options, EnvOf(variables));
-    EXPECT_EQ(process.Fetch(false).properties.at("awsAccessKey"), "AKID1");
-    const credentials::Result again = process.Fetch(true);
-    EXPECT_EQ(again.properties.at("awsAccessKey"), "AKID2");
-    EXPECT_EQ(again.properties.at("awsSecretKey"), "s3cr3t");
-    EXPECT_EQ(again.properties.at("region"), "eu-west-3");
-    EXPECT_EQ(capture.CountContaining("s3cr3t"), 0u);
-
-    options.credentialProcess = "echo '{\"AccessKeyId\":\"a\",\"SecretAccessKey\":\"b\"}'";
     const credentials::Result none = HostCredentials(options, EnvOf(variables)).Fetch(false);
     EXPECT_FALSE(none.ok);
     EXPECT_NE(none.why.find("credential process: long-term keys not exchanged"), std::string::npos)
@@ -227,6 +210,9 @@ TEST(HostCredentialsTest, CredentialProcessThenTheEnvironment) {
     variables["AWS_SESSION_TOKEN"] = "envtoken";
     const credentials::Result env = HostCredentials(options, EnvOf(variables)).Fetch(false);
     ASSERT_TRUE(env.ok) << env.why;
-    EXPECT_EQ(env.properties.at("awsAccessKey"), "AKIDENV");
-    EXPECT_EQ(env.properties.at("sessionToken"), "envtoken");
+    for (const auto& [name, value] : Variables{{"awsAccessKey", "AKIDENV"},
+                                               {"awsSecretKey", "envsecret"},
+                                               {"sessionToken", "envtoken"},
+                                               {"region", "eu-west-3"}})
+        EXPECT_EQ(env.properties.at(name), value) << name;
 }
