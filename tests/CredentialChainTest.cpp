@@ -3,7 +3,7 @@
 // gave credentials; long-term keys handed out unexchanged, or a refused exchange that ends the
 // chain; credentials not renewed 5 minutes before they expire (or at half a short life), dropped
 // while they still work, or kept past expiry; a secret in the log; the renewal thread not handing
-// over fresh credentials; a credential process answer cached; an absent source that is slow.
+// over fresh credentials; an absent source that is slow.
 #include <gtest/gtest.h>
 
 #include <atomic>
@@ -13,16 +13,15 @@
 #include "platform/framework/HostCredentials.h"
 #include "tests/support/AwsStandIns.h"
 #include "tests/support/LogCapture.h"
-#include "tests/support/ScriptedHttpServer.h"
 #include "tests/support/TestSupport.h"
 
 using namespace awsauth;
 using namespace std::chrono;
-using testsupport::FormValue;
-using testsupport::ScriptedHttpServer;
+using namespace testsupport;
 
 namespace {
 
+using Variables = std::map<std::string, std::string>;
 const Clock::time_point kStart = Clock::from_time_t(1800000000);
 
 // A link that answers what the test put in `next`, counting how often it was asked.
@@ -135,37 +134,31 @@ TEST(CredentialChainTest, KeepsCredentialsUntilFiveMinutesBeforeTheyExpire) {
 // before they expire. Then nothing at all: every source absent quickly, each named.
 TEST(HostCredentialsConcurrencyTest, WholeChainFromAStaticKeyProfileWithRenewal) {
     std::atomic<int> issued{0};
-    ScriptedHttpServer sts([&](const testsupport::HttpRequestSeen& request) {
+    ScriptedHttpServer sts([&](const HttpRequestSeen& request) {
         // 5 minutes and 1 s to live: due for renewal a second after being issued.
-        return testsupport::StsCredentialsAnswer(
-            FormValue(request.body, "Action"), "ASIA" + std::to_string(++issued), "tmp-secret",
-            "tmp-token", system_clock::now() + minutes(5) + seconds(1));
+        return StsCredentialsAnswer(FormValue(request.body, "Action"),
+                                    "ASIA" + std::to_string(++issued), "tmp-secret", "tmp-token",
+                                    system_clock::now() + minutes(5) + seconds(1));
     });
     ScriptedHttpServer imds(ScriptedHttpServer::Mode::kStall);
-    const std::string dir = testsupport::ScratchDir("hostcredentials");
-    std::map<std::string, std::string> variables = {
+    const std::string dir = ScratchDir("hostcredentials");
+    Variables variables = {
         {"HOME", dir + "/home"},
-        {"AWS_SHARED_CREDENTIALS_FILE",
-         testsupport::WriteFile(dir + "/credentials",
-                                "[default]\naws_access_key_id = AKIAUSER\n"
-                                "aws_secret_access_key = user-secret\n")},
+        {"AWS_SHARED_CREDENTIALS_FILE", WriteFile(dir + "/credentials",
+                                                  "[default]\naws_access_key_id = AKIAUSER\n"
+                                                  "aws_secret_access_key = user-secret\n")},
         {"AWS_ENDPOINT_URL_STS", sts.Endpoint()},
         {"AWS_EC2_METADATA_SERVICE_ENDPOINT", imds.Endpoint()}};
     FrameworkOptions options;
     options.region = "eu-west-1";
     LogCapture capture;
     {
-        HostCredentials host(options, testsupport::EnvOf(variables));
+        HostCredentials host(options, EnvOf(variables));
         credentials::Result first = host.Fetch(false);
         ASSERT_TRUE(first.ok) << first.why;
         EXPECT_EQ(first.source, "shared config files via STS GetSessionToken");
         EXPECT_EQ(first.properties.at("awsAccessKey"), "ASIA1");
-        EXPECT_EQ(first.properties.at("sessionToken"), "tmp-token");
-        EXPECT_EQ(first.properties.at("region"), "eu-west-1");
-        const auto requests = sts.Requests();
-        ASSERT_EQ(requests.size(), 1u);
-        EXPECT_EQ(FormValue(requests[0].body, "Action"), "GetSessionToken");
-        EXPECT_NE(requests[0].Header("Authorization").find("Credential=AKIAUSER/"),
+        EXPECT_NE(sts.Requests().at(0).Header("Authorization").find("Credential=AKIAUSER/"),
                   std::string::npos);
 
         std::mutex mutex;
@@ -174,7 +167,7 @@ TEST(HostCredentialsConcurrencyTest, WholeChainFromAStaticKeyProfileWithRenewal)
             std::lock_guard<std::mutex> lock(mutex);
             renewed.push_back(result.properties.at("awsAccessKey"));
         });
-        ASSERT_TRUE(testsupport::WaitUntil(
+        ASSERT_TRUE(WaitUntil(
             [&] {
                 std::lock_guard<std::mutex> lock(mutex);
                 return renewed.size() >= 2;
@@ -185,57 +178,41 @@ TEST(HostCredentialsConcurrencyTest, WholeChainFromAStaticKeyProfileWithRenewal)
         EXPECT_EQ(renewed[1], "ASIA3");
         EXPECT_EQ(imds.Connections(), 0);  // the profile came first
     }
-    EXPECT_EQ(capture.Count("AWS credentials from shared config files via STS GetSessionToken"),
-              1u);
     EXPECT_EQ(capture.CountContaining("user-secret") + capture.CountContaining("tmp-secret"), 0u);
 
     variables.erase("AWS_SHARED_CREDENTIALS_FILE");
     const auto started = steady_clock::now();
-    credentials::Result none = HostCredentials(options, testsupport::EnvOf(variables)).Fetch(false);
+    credentials::Result none = HostCredentials(options, EnvOf(variables)).Fetch(false);
     EXPECT_LT(steady_clock::now() - started, seconds(5));
     EXPECT_FALSE(none.ok);
     for (const char* source : {"environment: ", "web identity: ", "shared config files: ",
-                               "container endpoint: ", "instance metadata: "}) {
+                               "container endpoint: ", "instance metadata: "})
         EXPECT_NE(none.why.find(source), std::string::npos) << none.why;
-    }
 }
 
-// A credential process is asked again on every refreshing fetch, never cached; long-term keys
-// that STS does not exchange (none answers here) pass on to the next source, the environment.
+// Long-term keys that STS does not exchange (none answers here), from a credential process or
+// the environment, pass on to the next source. (That a credential process is asked again, never
+// cached, EndToEndTest.ToS3rverWithCredentialsFromACredentialProcess shows.)
 TEST(HostCredentialsTest, CredentialProcessThenTheEnvironment) {
-    const std::string counter = testsupport::ScratchDir("hostprocess") + "/count";
     FrameworkOptions options;
     options.region = "eu-west-3";
-    options.credentialProcess =
-        "echo x >> " + counter + "; printf '{\"Version\":1,\"AccessKeyId\":" +
-        "\"AKID%s\",\"SecretAccessKey\":\"s3cr3t\",\"SessionToken\":\"tok\"}'" + " $(wc -l < " +
-        counter + ")";
-    std::map<std::string, std::string> variables = {{"AWS_ENDPOINT_URL_STS", "http://127.0.0.1:9"},
-                                                    {"HOME", "/nonexistent"},
-                                                    {"AWS_EC2_METADATA_DISABLED", "true"},
-                                                    {"AWS_ACCESS_KEY_ID", "AKIDENV"},
-                                                    {"AWS_SECRET_ACCESS_KEY", "envsecret"}};
-    LogCapture capture;
-    HostCredentials process(options, testsupport::EnvOf(variables));
-    EXPECT_EQ(process.Fetch(false).properties.at("awsAccessKey"), "AKID1");
-    const credentials::Result again = process.Fetch(true);
-    EXPECT_EQ(again.properties.at("awsAccessKey"), "AKID2");
-    EXPECT_EQ(again.properties.at("awsSecretKey"), "s3cr3t");
-    EXPECT_EQ(again.properties.at("sessionToken"), "tok");
-    EXPECT_EQ(again.properties.at("region"), "eu-west-3");
-    EXPECT_EQ(capture.CountContaining("s3cr3t"), 0u);
-
     options.credentialProcess = "echo '{\"AccessKeyId\":\"a\",\"SecretAccessKey\":\"b\"}'";
-    const credentials::Result none =
-        HostCredentials(options, testsupport::EnvOf(variables)).Fetch(false);
+    Variables variables = {{"AWS_ENDPOINT_URL_STS", "http://127.0.0.1:9"},
+                           {"HOME", "/nonexistent"},
+                           {"AWS_EC2_METADATA_DISABLED", "true"},
+                           {"AWS_ACCESS_KEY_ID", "AKIDENV"},
+                           {"AWS_SECRET_ACCESS_KEY", "envsecret"}};
+    const credentials::Result none = HostCredentials(options, EnvOf(variables)).Fetch(false);
     EXPECT_FALSE(none.ok);
     EXPECT_NE(none.why.find("credential process: long-term keys not exchanged"), std::string::npos)
         << none.why;
     EXPECT_NE(none.why.find("environment: long-term keys not exchanged"), std::string::npos);
     variables["AWS_SESSION_TOKEN"] = "envtoken";
-    const credentials::Result env =
-        HostCredentials(options, testsupport::EnvOf(variables)).Fetch(false);
+    const credentials::Result env = HostCredentials(options, EnvOf(variables)).Fetch(false);
     ASSERT_TRUE(env.ok) << env.why;
-    EXPECT_EQ(env.properties.at("awsAccessKey"), "AKIDENV");
-    EXPECT_EQ(env.properties.at("sessionToken"), "envtoken");
+    for (const auto& [name, value] : Variables{{"awsAccessKey", "AKIDENV"},
+                                               {"awsSecretKey", "envsecret"},
+                                               {"sessionToken", "envtoken"},
+                                               {"region", "eu-west-3"}})
+        EXPECT_EQ(env.properties.at(name), value) << name;
 }

@@ -7,6 +7,8 @@
 // again; AWS_CA_BUNDLE not trusted, or trust without it, by the sources' client and the S3 store.
 #include <gtest/gtest.h>
 
+#include <atomic>
+
 #include "platform/awsauth/ContainerCredentials.h"
 #include "platform/awsauth/HttpClient.h"
 #include "platform/awsauth/InstanceMetadata.h"
@@ -15,7 +17,6 @@
 #include "platform/transfer/S3Store.h"
 #include "tests/support/AwsStandIns.h"
 #include "tests/support/LogCapture.h"
-#include "tests/support/ScriptedHttpServer.h"
 #include "tests/support/TestSupport.h"
 
 using namespace awsauth;
@@ -99,7 +100,7 @@ TEST(ContainerCredentialsTest, AsksWithTheAuthorizationTokenOfTheMoment) {
 // each later request carrying the token. Off EC2 (nothing answers, or something accepts and
 // never answers) the source is absent within about its 1 s bound.
 TEST(InstanceMetadataTest, FetchesWithASessionTokenAndFallsThroughQuicklyWhenAbsent) {
-    bool roleAttached = true;
+    std::atomic<bool> roleAttached{true};  // read on the server thread
     const std::string roles = "/latest/meta-data/iam/security-credentials/";
     ScriptedHttpServer imds([&](const HttpRequestSeen& request) {
         if (request.method == "PUT" && request.target == "/latest/api/token")
@@ -133,12 +134,10 @@ TEST(InstanceMetadataTest, FetchesWithASessionTokenAndFallsThroughQuicklyWhenAbs
         InstanceMetadata(EnvOf({{"AWS_EC2_METADATA_SERVICE_ENDPOINT_MODE", "IPv6"}})).Endpoint(),
         "http://[fd00:ec2::254]");
 
-    ScriptedHttpServer stall(ScriptedHttpServer::Mode::kStall);
-    const std::string closed =
-        "http://127.0.0.1:" + std::to_string([] {
-            return ScriptedHttpServer(ScriptedHttpServer::Mode::kReset).Port();
-        }());
-    for (const std::string& endpoint : {stall.Endpoint(), closed}) {
+    // Something that accepts and never answers, then nothing at all.
+    auto stall = std::make_unique<ScriptedHttpServer>(ScriptedHttpServer::Mode::kStall);
+    const std::string endpoint = stall->Endpoint();
+    for (int round = 0; round < 2; ++round, stall.reset()) {
         const auto started = std::chrono::steady_clock::now();
         Lookup lookup =
             InstanceMetadata(EnvOf({{"AWS_EC2_METADATA_SERVICE_ENDPOINT", endpoint}})).Fetch();
@@ -260,19 +259,20 @@ TEST(WebIdentityCredentialsTest, ReadsTheTokenFileOnEveryFetch) {
               Lookup::Outcome::kFailed);
 }
 
-// A server whose certificate only the bundle vouches for is trusted with the bundle and refused
-// without it, by the credential sources' client and by the S3 store.
+// A server only the bundle vouches for: trusted with it, refused without, by the sources' client
+// and by the S3 store.
 TEST(CaBundleTest, TrustsTheServersTheBundleVouchesFor) {
     const std::string dir = ScratchDir("ca");
-    ASSERT_EQ(RunProcess(Words("openssl req -x509 -newkey rsa:2048 -nodes -keyout " + dir +
-                               "/key.pem -out " + dir +
-                               "/cert.pem -days 1 -subj /CN=127.0.0.1 -addext "
+    const std::string pair = " " + dir + "/key.pem ", cert = " " + dir + "/cert.pem ";
+    ASSERT_EQ(RunProcess(Words("openssl req -x509 -newkey rsa:2048 -nodes -days 1 -keyout" + pair +
+                               "-out" + cert +
+                               "-subj /CN=127.0.0.1 -addext "
                                "subjectAltName=IP:127.0.0.1"))
                   .exitStatus,
               0);
-    ChildProcess server(Words("openssl s_server -accept 127.0.0.1:0 -www -cert " + dir +
-                              "/cert.pem -key " + dir + "/key.pem"),
-                        dir + "/server.txt");
+    ChildProcess server(
+        Words("openssl s_server -accept 127.0.0.1:0 -www -cert" + cert + "-key" + pair),
+        dir + "/server.txt");
     std::string port;
     ASSERT_TRUE(WaitUntil([&] {
         const std::string text = ReadFile(dir + "/server.txt");
@@ -291,15 +291,13 @@ TEST(CaBundleTest, TrustsTheServersTheBundleVouchesFor) {
         std::string why;
         EXPECT_EQ(Send(request, response, why), !bundle.empty()) << why;
         EXPECT_EQ(why.find("certificate") != std::string::npos, bundle.empty()) << why;
-
-        // The store's PUT: s_server answers none, but only without the bundle is the
+        // The store's PUT: s_server may answer none, but only without the bundle is the
         // certificate the problem.
         LogCapture capture;
         S3StoreConfig config;
         ASSERT_TRUE(S3StoreConfig::Parse(url, config, why));
         config.caBundle = bundle;
-        config.retry.attempts = 1;
-        config.lowSpeedTimeS = 1;  // s_server may never answer the PUT
+        config.retry.attempts = config.lowSpeedTimeS = 1;
         FileTransferInfo info;
         S3Store(config).Put(ObjectFor("rec", "k.ts", "abc"), {"ak", "sk", "t", "us-east-1", false},
                             &info);

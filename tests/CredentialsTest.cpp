@@ -57,48 +57,36 @@ TEST(CredentialsTest, CredentialProcessIsBoundedAndLeavesNoProcessBehind) {
             << why;
         canceller.join();
         EXPECT_EQ(why, c.why);
-        if (c.ok) {
-            EXPECT_NE(output.find("\"SessionToken\":\"T\""), std::string::npos);
-        }
+        EXPECT_TRUE(!c.ok || output.find("\"SessionToken\":\"T\"") != std::string::npos);
         // Nothing of the group outlives the call.
-        if (!ReadFile(pidFile).empty()) {
-            EXPECT_TRUE(testsupport::WaitUntil([&] { return Gone(ReadFile(pidFile)); }, 30000));
-        }
-        close(cancel[0]);
-        close(cancel[1]);
+        EXPECT_TRUE(ReadFile(pidFile).empty() ||
+                    testsupport::WaitUntil([&] { return Gone(ReadFile(pidFile)); }, 30000));
+        for (int fd : cancel) close(fd);
     }
     unlink(pidFile.c_str());
 }
 
 TEST(CredentialsTest, ControlCharactersInKeysOrTokenAreRefused) {
-    const struct {
-        std::map<std::string, std::string> environment;
-        std::string process;  // its AccessKeyId, JSON-escaped; "": the environment is read
-        std::string why;
-    } cases[] = {
-        {{{"AWS_ACCESS_KEY_ID", "AKID\r\nX-Injected: 1"}, {"AWS_SECRET_ACCESS_KEY", "s"}},
-         "",
-         "AWS_ACCESS_KEY_ID holds a control character"},
-        {{{"AWS_ACCESS_KEY_ID", "AKID"}, {"AWS_SECRET_ACCESS_KEY", "s\n"}},
-         "",
-         "AWS_SECRET_ACCESS_KEY holds a control character"},
-        {{{"AWS_ACCESS_KEY_ID", "AKID"},
-          {"AWS_SECRET_ACCESS_KEY", "s"},
-          {"AWS_SESSION_TOKEN", "\x7f"}},
-         "",
-         "AWS_SESSION_TOKEN holds a control character"},
-        {{}, "A\\r\\nX-Injected: 1", "its AccessKeyId holds a control character"},
+    const std::pair<std::string, std::string> cases[] = {
+        {"AWS_ACCESS_KEY_ID", "AKID\r\nX-Injected: 1"},
+        {"AWS_SECRET_ACCESS_KEY", "s\n"},
+        {"AWS_SESSION_TOKEN", "\x7f"},
+        {"its AccessKeyId", "A\\r\\nX-Injected: 1"},  // of a credential process, JSON-escaped
     };
-    for (const auto& c : cases) {
-        SCOPED_TRACE(c.why);
-        auto lookup = c.process.empty()
-                          ? credentials::FromEnvironment(testsupport::EnvOf(c.environment))
+    for (const auto& [name, value] : cases) {
+        SCOPED_TRACE(name);
+        std::map<std::string, std::string> environment = {{"AWS_ACCESS_KEY_ID", "AKID"},
+                                                          {"AWS_SECRET_ACCESS_KEY", "s"}};
+        environment[name] = value;
+        auto lookup = name.rfind("AWS_", 0) == 0
+                          ? credentials::FromEnvironment(testsupport::EnvOf(environment))
                           : credentials::FromCredentialProcess(
                                 "printf '{\"AccessKeyId\":\"%s\",\"SecretAccessKey\":\"S\","
                                 "\"SessionToken\":\"T\"}' '" +
-                                c.process + "'");
+                                value + "'");
         EXPECT_FALSE(lookup.Ok());
-        EXPECT_NE(lookup.why.find(c.why), std::string::npos) << lookup.why;
+        EXPECT_NE(lookup.why.find(name + " holds a control character"), std::string::npos)
+            << lookup.why;
         EXPECT_EQ(lookup.why.find("X-Injected"), std::string::npos);
     }
 }

@@ -37,12 +37,11 @@ class LocalDirectoryStoreTest : public ::testing::Test {
 
 TEST_F(LocalDirectoryStoreTest, ReaderSeesTheWholeObjectOrNothing) {
     const std::string key = "cam1/2026/12/06/cam1_20261206T110000.000Z_1.ts";
-    const std::string path = root_ + "/rec/" + key;
+    const std::string path = dir_.Path(key);
     std::string bytes(48 << 20, '\0');
     for (size_t i = 0; i < bytes.size(); ++i) bytes[i] = static_cast<char>(i * 7);
 
-    // A reader that looks at the key as often as it can while the object is written: whenever
-    // the key exists, it already has every byte.
+    // A reader looking at the key as often as it can: whenever it exists, it has every byte.
     std::atomic<bool> done{false};
     std::atomic<size_t> partialSightings{0}, sightings{0};
     std::thread reader([&] {
@@ -94,8 +93,7 @@ TEST_F(LocalDirectoryStoreTest, PathsOutsideAnExistingBucketAreFilePathErrors) {
     for (const char* key : {"out/a.ts", "out/rec/a.ts", "in/a.ts"})
         EXPECT_EQ(FilePathError, Put(key, "x")) << key;
     EXPECT_EQ(std::vector<std::string>{"rec"}, Entries(outside.Root()));
-    unlink((root_ + "/rec/out").c_str());
-    unlink((root_ + "/rec/in").c_str());
+    for (const char* link : {"out", "in"}) unlink(dir_.Path(link).c_str());
     LocalDirectoryStore noRoot(root_ + "/nowhere");
     EXPECT_EQ(FilePathError, noRoot.Put(ObjectFor("rec", "a.ts", "x"), StoreCredentials(), &info_));
     // A key part that is a file where a directory must be.
@@ -110,24 +108,20 @@ TEST_F(LocalDirectoryStoreTest, WriteErrorIsAnInternalErrorAndLeavesNothing) {
     std::string big(3 << 20, 'x');
     struct rlimit saved {};
     getrlimit(RLIMIT_FSIZE, &saved);
-    struct sigaction ignore {
-    }, previous{};
-    ignore.sa_handler = SIG_IGN;
-    sigaction(SIGXFSZ, &ignore, &previous);
+    const auto previous = signal(SIGXFSZ, SIG_IGN);
     struct rlimit limit = saved;
     limit.rlim_cur = 1 << 20;
     ASSERT_EQ(0, setrlimit(RLIMIT_FSIZE, &limit));
     FileTransferResult result = Put("cam1/a.ts", big);
     setrlimit(RLIMIT_FSIZE, &saved);
-    sigaction(SIGXFSZ, &previous, nullptr);
+    signal(SIGXFSZ, previous);
     EXPECT_EQ(InternalError, result);
     EXPECT_EQ(0u, info_.fileSize);
     EXPECT_TRUE(Entries(root_ + "/rec/cam1").empty());
 }
 
 TEST_F(LocalDirectoryStoreTest, CancelEndsARunningPutAndEveryLaterOne) {
-    // Cancel while a large object is being written: the Put ends with TimeOut (or had already
-    // stored it whole), and no temporary file stays behind.
+    // Cancelled while writing: TimeOut (or already stored whole), and no temporary file left.
     std::string big(128 << 20, 'x');
     std::atomic<bool> started{false};
     FileTransferResult running = Success;
@@ -143,7 +137,7 @@ TEST_F(LocalDirectoryStoreTest, CancelEndsARunningPutAndEveryLaterOne) {
 
     EXPECT_EQ(TimeOut, Put("cam1/later.ts", "x"));
     EXPECT_EQ(0u, info_.fileSize);
-    EXPECT_NE(0, access((root_ + "/rec/cam1/later.ts").c_str(), F_OK));
+    EXPECT_NE(0, access(dir_.Path("cam1/later.ts").c_str(), F_OK));
 }
 
 }  // namespace

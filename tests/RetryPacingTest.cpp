@@ -1,8 +1,7 @@
 // Pacing after failures. Faults guarded: retry waits outside their jittered, capped bounds; a
 // floor between failed transfers that does not double to its cap or is not reset by a success;
-// a store that keeps refusing (s3rver with a wrong secret, a missing local bucket, a server that
-// answers 503) tried without bound when the recorder asks again at once; Cancel not ending the
-// wait after a failure.
+// a store that keeps refusing (a wrong signature, a missing local bucket, 503) tried without
+// bound when the recorder asks again at once; Cancel not ending the wait after a failure.
 #include <gtest/gtest.h>
 
 #include <atomic>
@@ -14,7 +13,6 @@
 #include "platform/transfer/S3Store.h"
 #include "platform/transfer/SegmentTransfer.h"
 #include "tests/support/LogCapture.h"
-#include "tests/support/S3rver.h"
 #include "tests/support/ScriptedHttpServer.h"
 #include "tests/support/StoreRoot.h"
 #include "tests/support/TestSupport.h"
@@ -25,16 +23,15 @@ using namespace testsupport;
 namespace {
 
 TEST(RetryPacingTest, RetryWaitsGrowToTheirCapAndTheFloorDoublesUntilASuccess) {
-    RetryPolicy policy;  // retries: base 100 ms, cap 20 s; floor: 200 ms doubling to 30 s
-    const struct {
-        int retry;
-        uint64_t random;
-        int64_t ms;
-    } waits[] = {{1, 100, 100},     {1, 101, 0},        {2, 200, 200}, {2, 1000, 1000 % 201},
-                 {9, 19999, 19999}, {40, 20000, 20000}, {40, 20001, 0}};
-    for (const auto& w : waits)
-        EXPECT_EQ(RetryDelay(policy, w.retry, w.random).count(), w.ms)
-            << w.retry << " " << w.random;
+    RetryPolicy policy;         // retries: base 100 ms, cap 20 s; floor: 200 ms doubling to 30 s
+    const int64_t waits[][3] = {// retry, random, wait (ms)
+                                {1, 100, 100},         {1, 101, 0},       {2, 200, 200},
+                                {2, 1000, 1000 % 201}, {9, 19999, 19999}, {40, 20000, 20000},
+                                {40, 20001, 0}};
+    for (const auto& [retry, random, ms] : waits)
+        EXPECT_EQ(
+            RetryDelay(policy, static_cast<int>(retry), static_cast<uint64_t>(random)).count(), ms)
+            << retry << " " << random;
     policy.jitter = false;
     EXPECT_EQ(RetryDelay(policy, 3, 0).count(), 400);
 
@@ -53,13 +50,13 @@ TEST(RetryPacingTest, RetryWaitsGrowToTheirCapAndTheFloorDoublesUntilASuccess) {
     EXPECT_EQ(duration_cast<milliseconds>(floor.Remaining(t0)).count(), 200);
 }
 
-FileTransferRequest OneSample(const std::string& bucket, const std::string& secret) {
+FileTransferRequest OneSample(const std::string& bucket) {
     FileTransferRequest request;
     request.streamingId = "cam1";
     request.sequenceNumber = 1;
     request.bucketName = bucket;
-    request.accessKey = S3rver::kAccessKey;
-    request.secretKey = secret;
+    request.accessKey = "ak";
+    request.secretKey = "sk";
     request.region = "us-east-1";
     request.video.push_back(*MakeVideo(0, true));
     return request;
@@ -68,11 +65,9 @@ FileTransferRequest OneSample(const std::string& bucket, const std::string& secr
 // The recorder asks again at once after most failures; for 3 s here. Transfers start at 0,
 // 0.2, 0.6, 1.4 and 3.0 s; each tries at most three times when the failure may pass.
 TEST(RetryPacingTest, AStoreThatKeepsRefusingIsTriedABoundedNumberOfTimes) {
-    S3rver s3rver;
-    ASSERT_TRUE(s3rver.Start(SFR_SOURCE_DIR "/scripts/s3rver.sh", BuildPath("node")))
-        << s3rver.Error();
-    ScriptedHttpServer busy(ScriptedHttpServer::Mode::kRespond,
-                            S3ErrorAnswer("503 Slow Down", "SlowDown"));
+    ScriptedHttpServer refusing(ScriptedHttpServer::Mode::kRespond,
+                                S3ErrorAnswer("403 Forbidden", "SignatureDoesNotMatch")),
+        busy(ScriptedHttpServer::Mode::kRespond, S3ErrorAnswer("503 Slow Down", "SlowDown"));
     StoreRoot root;
     auto s3 = [](const std::string& endpoint) {
         S3StoreConfig config;
@@ -86,10 +81,10 @@ TEST(RetryPacingTest, AStoreThatKeepsRefusingIsTriedABoundedNumberOfTimes) {
         FileTransferRequest request;
         int attempts;  // per transfer
     } cases[] = {
-        {"wrong secret", s3(s3rver.Endpoint()), OneSample("rec", "wrong-secret"), 1},
-        {"503", s3(busy.Endpoint()), OneSample("rec", S3rver::kSecretKey), 3},
-        {"missing bucket", std::make_shared<LocalDirectoryStore>(root.Root()),
-         OneSample("missing", ""), 1},
+        {"wrong signature", s3(refusing.Endpoint()), OneSample("rec"), 1},
+        {"503", s3(busy.Endpoint()), OneSample("rec"), 3},
+        {"missing bucket", std::make_shared<LocalDirectoryStore>(root.Root()), OneSample("missing"),
+         1},
     };
     for (const auto& c : cases) {
         LogCapture log;
@@ -105,6 +100,7 @@ TEST(RetryPacingTest, AStoreThatKeepsRefusingIsTriedABoundedNumberOfTimes) {
         EXPECT_GE(requests, static_cast<size_t>(transfers)) << c.name;
         EXPECT_LE(requests, static_cast<size_t>(transfers * c.attempts)) << c.name;
     }
+    EXPECT_LE(refusing.Connections(), 6);
     EXPECT_LE(busy.Connections(), 18);
 }
 
@@ -115,7 +111,7 @@ TEST(RetryPacingConcurrencyTest, CancelEndsTheWaitAfterAFailure) {
     pacing.floorStart = minutes(1);
     SegmentTransfer transfer(std::make_shared<LocalDirectoryStore>(root.Root()), "",
                              SegmentFormat::Ts(), pacing);
-    const FileTransferRequest request = OneSample("missing", "");
+    const FileTransferRequest request = OneSample("missing");
     ASSERT_EQ(FilePathError, transfer.Transfer(request, nullptr));
     LogCapture log;
     std::atomic<int> result{-1};

@@ -1,11 +1,7 @@
-// S3rver: runs the S3 test server (scripts/s3rver.sh, @20minutes/s3rver) as a child process
-// on 127.0.0.1 for one test or benchmark program.
-//
-// Header-only so that benchmarks, which do not link the test support library, can use it too.
-// Each instance has its own data directory and port, so parallel test processes do not meet;
-// the script serialises the one-time npm install into the build tree. The server also ends by
-// itself when this process dies (its standard input is a pipe held here). Not thread-safe: one
-// thread starts and stops it.
+// S3rver: runs the S3 test server (scripts/s3rver.sh, @20minutes/s3rver) as a child process on
+// 127.0.0.1. Header-only: the benchmarks, which do not link the test support library, use it too.
+// Each instance has its own data directory and port; the server also ends when this process dies
+// (its standard input is a pipe held here). One thread starts and stops it.
 #pragma once
 
 #include <poll.h>
@@ -41,20 +37,11 @@ class S3rver {
         if (mkdtemp(templ) == nullptr) return Fail("mkdtemp failed");
         dataDir_ = templ;
         int in[2], out[2];
-        if (pipe(in) != 0) return Fail("pipe failed");
-        if (pipe(out) != 0) {
-            close(in[0]);
-            close(in[1]);
-            return Fail("pipe failed");
-        }
-        pid_ = fork();
+        if (pipe(in) != 0 || pipe(out) != 0 || (pid_ = fork()) < 0) return Fail("cannot fork");
         if (pid_ == 0) {
             dup2(in[0], 0);
             dup2(out[1], 1);
-            close(in[0]);
-            close(in[1]);
-            close(out[0]);
-            close(out[1]);
+            for (int fd : {in[0], in[1], out[0], out[1]}) close(fd);
             execl("/bin/bash", "bash", script.c_str(), nodePrefix.c_str(), dataDir_.c_str(),
                   kAccessKey, kSecretKey, kBucket, static_cast<char*>(nullptr));
             _exit(127);
@@ -62,47 +49,32 @@ class S3rver {
         close(in[0]);
         close(out[1]);
         stdin_ = in[1];
-        int stdoutFd = out[0];
-        if (pid_ < 0) {
-            close(stdoutFd);
-            return Fail("fork failed");
-        }
-        std::string line;
-        auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
-        while (line.find('\n') == std::string::npos) {
-            auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
-                            deadline - std::chrono::steady_clock::now())
-                            .count();
-            pollfd p{stdoutFd, POLLIN, 0};
-            if (left <= 0 || poll(&p, 1, static_cast<int>(left)) <= 0) break;
-            char buffer[64];
-            ssize_t n = read(stdoutFd, buffer, sizeof buffer);
-            if (n <= 0) break;
+        std::string line;  // the port, on the first line
+        const auto deadline =
+            std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
+        for (char buffer[64]; line.find('\n') == std::string::npos;) {
+            const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
+                deadline - std::chrono::steady_clock::now());
+            pollfd p{out[0], POLLIN, 0};
+            ssize_t n = 0;
+            if (left.count() <= 0 || poll(&p, 1, static_cast<int>(left.count())) <= 0 ||
+                (n = read(out[0], buffer, sizeof buffer)) <= 0)
+                break;
             line.append(buffer, static_cast<size_t>(n));
         }
-        close(stdoutFd);
-        port_ = std::atoi(line.c_str());
-        if (port_ <= 0) {
-            Stop();
-            return Fail("s3rver did not report a port (output \"" + line + "\")");
-        }
-        return true;
+        close(out[0]);
+        if ((port_ = std::atoi(line.c_str())) > 0) return true;
+        Stop();
+        return Fail("s3rver did not report a port (output \"" + line + "\")");
     }
 
     // Ends the server and removes its data. Idempotent.
     void Stop() {
         if (stdin_ >= 0) close(stdin_);
-        stdin_ = -1;
-        if (pid_ > 0) {
-            kill(pid_, SIGTERM);
-            int status = 0;
-            waitpid(pid_, &status, 0);
-        }
-        pid_ = -1;
-        if (!dataDir_.empty()) {
-            std::error_code ignored;
-            std::filesystem::remove_all(dataDir_, ignored);
-        }
+        if (pid_ > 0 && kill(pid_, SIGTERM) == 0) waitpid(pid_, nullptr, 0);
+        std::error_code ignored;
+        if (!dataDir_.empty()) std::filesystem::remove_all(dataDir_, ignored);
+        stdin_ = pid_ = -1;
         dataDir_.clear();
     }
 
