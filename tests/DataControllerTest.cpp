@@ -73,7 +73,7 @@ struct Rig {
 TEST(DataControllerReports, SuccessIsReportedWithItsUploadInfoLineAndClearsOnlyAWarning) {
     Rig rig;
     rig.transfer->SetInfo({1048576, 850});
-    rig.observer.SetState(Warning, 29);
+    rig.observer.SetState(Warning);
     rig.Push(3, 1);
     rig.Push(1, 20000);
     rig.controller->Start();
@@ -95,7 +95,7 @@ TEST(DataControllerReports, SuccessIsReportedWithItsUploadInfoLineAndClearsOnlyA
     EXPECT_EQ(rig.observer.State(), Executing);
 
     size_t executes = rig.observer.ExecuteCalls();
-    rig.observer.SetState(Error, 21);
+    rig.observer.SetState(Error);
     rig.Push(1, 10);
     ASSERT_TRUE(rig.WaitEntries(5));
     EXPECT_EQ(rig.observer.State(), Error);
@@ -177,30 +177,35 @@ TEST(DataControllerRetries, ErrorResultsAreRetriedAtOnceADisabledUploaderNever) 
 }
 
 TEST(DataControllerGivingUp, EachResultGivesUpWithItsNameAndWarningCode) {
-    const std::pair<FileTransferResult, std::pair<const char*, unsigned>> cases[] = {
-        {TimeOut, {"TimeOut", 22}},
-        {FilePathError, {"FilePathError", 24}},
-        {FileBroken, {"FileBroken", 25}},
-        {NetworkError, {"NetworkError", 26}},
-        {RequestTimeTooSkewed, {"RequestTimeTooSkewed", 27}},
-        {InternalError, {"InternalError", 28}},
-        {static_cast<FileTransferResult>(0x80000099), {"Unknown", 0}},
+    const struct {
+        FileTransferResult result;
+        const char* name;
+        std::vector<unsigned> warnings;  // an authentication error warns only from the second
+    } cases[] = {
+        {TimeOut, "TimeOut", {22}},
+        {FilePathError, "FilePathError", {24}},
+        {FileBroken, "FileBroken", {25}},
+        {NetworkError, "NetworkError", {26}},
+        {RequestTimeTooSkewed, "RequestTimeTooSkewed", {27}},
+        {InternalError, "InternalError", {28}},
+        {static_cast<FileTransferResult>(0x80000099), "Unknown", {0}},
+        {AuthenticationError, "AuthenticationError", {}},
     };
-    for (const auto& [result, expected] : cases) {
-        SCOPED_TRACE(expected.first);
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.name);
         // Limit 1000 ms; three files of 600 ms: after the first is popped 1200 remain.
         Rig rig(1000);
-        rig.transfer->Script({result});
+        rig.transfer->Script({c.result});
+        rig.observer.OnTokenRequest([&] { rig.controller->SetAwsInfo(credentials("2")); });
         rig.Push(3, 600);
         rig.controller->Start();
         ASSERT_TRUE(rig.WaitEntries(3));
         auto entries = rig.entries();
         auto infos = rig.observer.UploadInfos();
-        EXPECT_EQ(entries[0].errorName, expected.first);
+        EXPECT_EQ(entries[0].errorName, c.name);
         EXPECT_FALSE(entries[0].succeeded);
-        EXPECT_EQ(rig.observer.Warnings(), std::vector<unsigned>{expected.second});
-        EXPECT_EQ(infos[0].find(std::string("FileIndex, 1, ErrorCode, ") + expected.first + ", "),
-                  0u);
+        EXPECT_EQ(rig.observer.Warnings(), c.warnings);
+        EXPECT_EQ(infos[0].find(std::string("FileIndex, 1, ErrorCode, ") + c.name + ", "), 0u);
         // The second file is dropped for the over-full buffer, the third uploaded.
         EXPECT_EQ(entries[1].errorName, "BufferOver");
         EXPECT_EQ(entries[1].duration, 600u);
@@ -212,17 +217,7 @@ TEST(DataControllerGivingUp, EachResultGivesUpWithItsNameAndWarningCode) {
     }
 }
 
-TEST(DataControllerGivingUp, AuthenticationErrorWarnsOnlyFromTheSecondInARow) {
-    {
-        Rig rig(1000);
-        rig.transfer->Script({AuthenticationError});
-        rig.observer.OnTokenRequest([&] { rig.controller->SetAwsInfo(credentials("2")); });
-        rig.Push(3, 600);
-        rig.controller->Start();
-        ASSERT_TRUE(rig.WaitEntries(3));
-        EXPECT_EQ(rig.entries()[0].errorName, "AuthenticationError");
-        EXPECT_TRUE(rig.observer.Warnings().empty());  // only one in a row
-    }
+TEST(DataControllerGivingUp, AuthenticationErrorWarnsFromTheSecondInARow) {
     Rig rig(1000, 0, true, false);
     // No credentials at all. File 1 is given up at its first authentication error, files 2
     // and 3 are dropped; file 4 then fails again (the second in a row) and is given up with

@@ -142,18 +142,7 @@ TEST(FileRecorderModuleGate, DisconnectBeforeAnySampleOrDuringTheWindowEndsTheWa
     }
 }
 
-TEST(FileRecorderModuleWiring, RepeatedConnectionReplyIsIgnored) {
-    LogCapture log;
-    Pipeline p;
-    p.Connect();
-    p.Connect();
-    EXPECT_EQ(countFrom(log, "src/DataController", "Start enter."), 1u);
-    EXPECT_EQ(countFrom(log, "src/StreamBuffer", "Start enter."), 1u);
-    EXPECT_TRUE(log.Contains("connection reply while connected: ignored."));
-    EXPECT_NE(p.h.Process().GetProcessStatus(), Error);
-}
-
-TEST(FileRecorderModuleWiring, CredentialsAreCheckedInByteOrderOfTheirKeys) {
+TEST(FileRecorderModuleWiring, RepeatedConnectionReplyIsIgnoredCredentialsCheckedInKeyOrder) {
     struct Case {
         std::map<std::string, std::string> properties;
         const char* missing;  // null: accepted
@@ -172,6 +161,11 @@ TEST(FileRecorderModuleWiring, CredentialsAreCheckedInByteOrderOfTheirKeys) {
         LogCapture log;
         Pipeline p;
         p.Connect();
+        p.Connect();
+        EXPECT_EQ(countFrom(log, "src/DataController", "Start enter."), 1u);
+        EXPECT_EQ(countFrom(log, "src/StreamBuffer", "Start enter."), 1u);
+        EXPECT_TRUE(log.Contains("connection reply while connected: ignored."));
+        EXPECT_NE(p.h.Process().GetProcessStatus(), Error);
         EXPECT_EQ(p.h.Host().SetProperties(c.properties), c.missing == nullptr);
         // The first missing key in byte order is the one named.
         EXPECT_TRUE(!c.missing || log.Contains(std::string(c.missing) + " is empty"));

@@ -92,10 +92,11 @@ class RecordingProcess : private CommandLineStorage, public BaseProcess {
     Seen seen_;
 };
 
-// A process with a media host for `args` (plus a discarded status output).
+// A process with a media host reading `input` with `options`, storing under /tmp.
 struct HostRun {
-    explicit HostRun(std::vector<std::string> args) {
-        args.insert(args.end(), {"-status", "/dev/null"});
+    HostRun(const std::string& input, const std::string& options) {
+        auto args = Words("-endpoint file:///tmp -status /dev/null " + options);
+        args.insert(args.begin(), {"-input", input});
         process = std::make_unique<RecordingProcess>(args);
         host = std::make_shared<MediaHost>(process->Options(), false);
         process->SetHost(host);
@@ -109,12 +110,6 @@ struct HostRun {
     std::unique_ptr<RecordingProcess> process;
     std::shared_ptr<MediaHost> host;
 };
-
-std::vector<std::string> Args(const std::string& clip, const std::string& more) {
-    std::vector<std::string> args = {"-input", clip};
-    for (auto& w : Words(more)) args.push_back(w);
-    return args;
-}
 
 std::string BFrameClip() {
     return MediaClip("mh_bframes.mp4",
@@ -131,7 +126,7 @@ TEST(MediaHostTest, DeliversEveryPacketOfAFileWithTheAttributeBlockInOrder) {
     const int64_t before = std::chrono::duration_cast<std::chrono::microseconds>(
                                std::chrono::system_clock::now().time_since_epoch())
                                .count();
-    Seen seen = HostRun(Args(clip, "-readrate 0 -endpoint file:///tmp -draintimeout 7")).Run();
+    Seen seen = HostRun(clip, "-readrate 0 -draintimeout 7").Run();
 
     EXPECT_EQ(seen.events, Words("connect credentials samples drain disconnect"));
     EXPECT_EQ(seen.drainTimeoutMs, 7000);
@@ -188,7 +183,7 @@ TEST(MediaHostTest, MetaTrackAndIgnoredTracks) {
     const std::string clip = testsupport::ClipWithId3(base, "mh_base_id3.ts");
     ASSERT_FALSE(clip.empty());
     LogCapture capture;
-    Seen seen = HostRun(Args(clip, "-readrate 0 -endpoint file:///tmp")).Run();
+    Seen seen = HostRun(clip, "-readrate 0").Run();
     EXPECT_FALSE(seen.video.empty());
     EXPECT_FALSE(seen.audio.empty());
     ASSERT_FALSE(seen.meta.empty());
@@ -199,11 +194,11 @@ TEST(MediaHostTest, MetaTrackAndIgnoredTracks) {
 TEST(MediaHostTest, ReadRatePacesAFileDurationEndsItStopEndsItEarly) {
     const std::string clip = BFrameClip();
     auto start = std::chrono::steady_clock::now();
-    HostRun(Args(clip, "-readrate 4 -endpoint file:///tmp")).Run();
+    HostRun(clip, "-readrate 4").Run();
     // 3 s of media at 4x: at least ~0.75 s less the pacer's slack.
     EXPECT_GE(std::chrono::steady_clock::now() - start, std::chrono::milliseconds(650));
 
-    Seen seen = HostRun(Args(clip, "-readrate 0 -duration 1.5 -endpoint file:///tmp")).Run();
+    Seen seen = HostRun(clip, "-readrate 0 -duration 1.5").Run();
     ASSERT_FALSE(seen.video.empty());
     EXPECT_LT(StreamData(seen.video.back()).timestamp, 1500u);
     EXPECT_GE(StreamData(seen.video.back()).timestamp, 1400u);
@@ -211,7 +206,7 @@ TEST(MediaHostTest, ReadRatePacesAFileDurationEndsItStopEndsItEarly) {
 
     // Stopped by the user, or by the module's error state: reading stops, the rest is drained.
     for (bool moduleError : {false, true}) {
-        HostRun slow(Args(clip, "-readrate 0.1 -endpoint file:///tmp"));
+        HostRun slow(clip, "-readrate 0.1");
         std::thread stopper([&] {
             testsupport::WaitUntil([&] { return !slow.process->Snapshot().video.empty(); }, 30000);
             moduleError ? slow.process->SetProcessStatus(Error, 21) : slow.host->Stop();
@@ -242,7 +237,7 @@ TEST(MediaHostTest, InputsThatCannotBeRecordedFailThePreparation) {
     for (const auto& c : cases) {
         SCOPED_TRACE(c.input);
         LogCapture capture;
-        EXPECT_FALSE(HostRun({"-input", c.input}).process->Initialize());
+        EXPECT_FALSE(HostRun(c.input, "").process->Initialize());
         std::vector<std::string> errors;
         for (const auto& r : capture.Records())
             if (r.priority == 4) errors.push_back(r.message);

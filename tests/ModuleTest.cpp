@@ -108,7 +108,11 @@ class RecordingModule : public Module {
     // Pushes video sample `t` and waits until the video hook holds it.
     bool HoldVideoAt(uint64_t t) { return HoldVideo(MakeSample(t)); }
     bool HoldVideo(std::shared_ptr<StreamData> sample) {
-        holdVideo = true;
+        {
+            std::lock_guard<std::mutex> lock(mutex);
+            holdVideo = true;
+            videoEntered = false;
+        }
         PushVideo(std::move(sample));
         return WaitUntil([&] { return Copy(videoEntered); });
     }
@@ -278,10 +282,6 @@ TEST(ModuleConcurrency, AWaitingProducerLosesNothingAndStopEndsItsWait) {
     EXPECT_EQ(module.Copy(module.video), inOrder);
     EXPECT_EQ(log.Count("queue overflow"), 0u);
 
-    {
-        std::lock_guard<std::mutex> lock(module.mutex);
-        module.videoEntered = false;
-    }
     ASSERT_TRUE(module.HoldVideoAt(200));
     for (uint64_t t = 201; t <= 250; ++t) module.PushVideo(MakeSample(t));
     std::atomic<int> waited{-1};

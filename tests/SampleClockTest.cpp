@@ -20,12 +20,6 @@ SampleClock::Times place(SampleClock& clock, SampleClock::Track track, int64_t d
     return t;
 }
 
-size_t countContaining(const LogCapture& capture, const std::string& text) {
-    size_t n = 0;
-    for (const auto& m : capture.Messages()) n += m.find(text) != std::string::npos;
-    return n;
-}
-
 TEST(SampleClockTest, TimesStartAtTheFirstPacketAndKeepReordering) {
     SampleClock clock;
     const int64_t base = 5000 * kSecond;
@@ -50,7 +44,7 @@ TEST(SampleClockTest, PacketsWithoutTimestampAreDroppedAndLoggedOnce) {
     // Garbage far outside any real clock counts as no timestamp.
     EXPECT_FALSE(clock.Place(kVideo, true, INT64_MAX, true, INT64_MIN, 0, &t));
     EXPECT_EQ(clock.DroppedWithoutTimestamp(), 3u);
-    EXPECT_EQ(countContaining(capture, "without a timestamp are dropped"), 1u);
+    EXPECT_EQ(capture.CountContaining("without a timestamp are dropped"), 1u);
     // Only one of the two: used for both. The first packet with a time is the origin.
     ASSERT_TRUE(clock.Place(kVideo, true, 7 * kSecond, false, 0, 0, &t));
     EXPECT_EQ(t.dtsUs, 0);
@@ -75,7 +69,7 @@ TEST(SampleClockTest, BackwardJumpOfAllTracksIsOneRebaseAndStaysContinuous) {
     EXPECT_EQ(v.ptsUs - v.dtsUs, kFrame);
     EXPECT_EQ(a.dtsUs - v.dtsUs, 5000);  // audio follows the same offset, in sync
     EXPECT_EQ(clock.Rebases(), 1u);
-    EXPECT_EQ(countContaining(capture, "jumped by"), 1u);
+    EXPECT_EQ(capture.CountContaining("jumped by"), 1u);
 }
 
 TEST(SampleClockTest, ForwardJumpsBeyondTenSecondsAreRebasedGapsBelowAreKept) {

@@ -23,8 +23,6 @@ using namespace testsupport;
 
 namespace {
 
-using StoreDirectory = StoreRoot;
-
 // The non-empty lines of `command`'s output.
 std::vector<std::string> Lines(const std::vector<std::string>& command) {
     std::vector<std::string> lines;
@@ -88,7 +86,7 @@ TEST(SegmentWriterClipTest, ConsecutiveObjectsProbeAndDecodeToTheSourceFrames) {
     std::vector<uint64_t> idrs = IdrTimes(clip);
     ASSERT_GE(idrs.size(), 2u);
     const uint64_t cut = idrs[idrs.size() / 2];
-    StoreDirectory dir;
+    StoreRoot dir;
     SegmentTransfer transfer(std::make_shared<LocalDirectoryStore>(dir.Root()), "");
     std::string objects;
     for (const auto& request : {ClipRequest(clip, 0, cut, 1), ClipRequest(clip, cut, 1000000, 2)}) {
@@ -146,7 +144,7 @@ struct EventLog {
 
 // No samples: nothing stored, success. Samples the muxer refuses: FileBroken. Then Cancel.
 TEST(SegmentTransferTest, EmptyAndRefusedRequestsStoreNothingAndCancelEndsEveryLaterTransfer) {
-    StoreDirectory dir;
+    StoreRoot dir;
     EventLog log;
     SegmentTransfer transfer(std::make_shared<LocalDirectoryStore>(dir.Root()), "");
     auto h264 = Track(TrackDescription::Kind::Video, "h264", 90000);
@@ -171,7 +169,7 @@ TEST(SegmentTransferTest, EmptyAndRefusedRequestsStoreNothingAndCancelEndsEveryL
 }
 
 TEST(SegmentTransferTest, AudioThatCannotTravelInTsIsLeftOutOnce) {
-    StoreDirectory dir;
+    StoreRoot dir;
     LogCapture log;
     EventLog stored;
     SegmentTransfer transfer(std::make_shared<LocalDirectoryStore>(dir.Root()), "p/");

@@ -84,9 +84,6 @@ class RecordingFileBuffer : public IFileBuffer {
 std::shared_ptr<StreamData> Audio(uint64_t ts) {
     return MakeSample(ts, ts * 48);
 }
-std::shared_ptr<StreamData> Meta(uint64_t ts, uint64_t rtpTime) {
-    return MakeSample(ts, rtpTime);
-}
 
 // One StreamBuffer with recording collaborators and the real H.264 IDR test.
 struct Rig {
@@ -104,16 +101,6 @@ struct Rig {
     }
     bool WaitLog(const std::string& message, size_t count = 1) {
         return WaitUntil([&] { return log.Count(message) >= count; });
-    }
-    // Messages from the first one equal to `from` up to (not including) the first `to` after
-    // it, or to the end.
-    std::vector<std::string> MessagesBetween(const std::string& from, const std::string& to = "") {
-        auto all = log.Messages();
-        auto begin = std::find(all.begin(), all.end(), from);
-        return {begin, to.empty() ? all.end() : std::find(begin, all.end(), to)};
-    }
-    bool WaitUploadInfo() {
-        return WaitUntil([&] { return !observer.UploadInfos().empty(); });
     }
 
     LogCapture log;
@@ -164,7 +151,7 @@ void FeedSorted(Rig& rig, std::vector<std::pair<uint64_t, char>> samples) {
         if (kind == 'A')
             rig.buffer->ReceiveAudio(Audio(ts));
         else if (kind == 'M')
-            rig.buffer->ReceiveMeta(Meta(ts, ts));
+            rig.buffer->ReceiveMeta(MakeSample(ts, ts));
         else
             rig.buffer->ReceiveVideo(MakeVideo(ts, kind == 'I'));
     }
@@ -212,7 +199,7 @@ TEST(StreamBufferFiling, CatchesUpAfterAGapWithOneIntervalPerFileInOneTick) {
     rig.buffer->Start();
     rig.buffer->ReceiveVideo(MakeVideo(0, true));
     rig.buffer->ReceiveVideo(MakeVideo(1000, false));
-    ASSERT_TRUE(rig.WaitUploadInfo());
+    ASSERT_TRUE(WaitUntil([&] { return !rig.observer.UploadInfos().empty(); }));
     EXPECT_EQ(rig.observer.UploadInfos()[0], "BufferOver");
     EXPECT_TRUE(rig.log.Contains("Queue Clear."));
 
@@ -241,10 +228,10 @@ TEST(StreamBufferFiling, CatchesUpAfterAGapWithOneIntervalPerFileInOneTick) {
 
     // All in the one tick that was held: no tick line between the first and the last file.
     ASSERT_TRUE(rig.WaitLog("ST: DUMP LEN [1000, 12000]."));
-    const auto between =
-        rig.MessagesBetween("ST: DUMP LEN [1000, 0].", "ST: DUMP LEN [1000, 12000].");
-    ASSERT_FALSE(between.empty());
-    EXPECT_EQ(std::count_if(between.begin(), between.end(),
+    const auto all = rig.log.Messages();
+    const auto first = std::find(all.begin(), all.end(), "ST: DUMP LEN [1000, 0].");
+    ASSERT_NE(first, all.end());
+    EXPECT_EQ(std::count_if(first, std::find(first, all.end(), "ST: DUMP LEN [1000, 12000]."),
                             [](const std::string& m) { return m.rfind("buffer_length", 0) == 0; }),
               0);
 }
@@ -348,10 +335,10 @@ TEST(StreamBufferIntake, FirstIdrFixesTheOriginAndTrimsOlderAudioAndMeta) {
     Rig rig(1, 10, 700);
     rig.buffer->Start();
     rig.buffer->ReceiveAudio(Audio(900));
-    rig.buffer->ReceiveMeta(Meta(950, 0));
+    rig.buffer->ReceiveMeta(MakeSample(950, 0));
     rig.buffer->ReceiveVideo(MakeVideo(950, false));  // before any IDR: dropped
     rig.buffer->ReceiveAudio(Audio(1000));
-    rig.buffer->ReceiveMeta(Meta(1000, 0));
+    rig.buffer->ReceiveMeta(MakeSample(1000, 0));
     rig.buffer->ReceiveVideo(MakeVideo(1000, true));
     rig.buffer->ReceiveVideo(MakeVideo(1500, true));  // a second IDR only opens a GOP
     rig.buffer->ReceiveVideo(MakeVideo(2100, false));
@@ -373,7 +360,7 @@ TEST(StreamBufferIntake, MetaBeforeStartIsWindowedAndDoesNotReleaseTheFilingThre
     Rig rig(1, 10);
     rig.buffer->Start();
     for (uint64_t rtp : {uint64_t{0}, uint64_t{100000}, uint64_t{200000}})
-        rig.buffer->ReceiveMetaBeforeStart(Meta(1000 + rtp / 1000, rtp));
+        rig.buffer->ReceiveMetaBeforeStart(MakeSample(1000 + rtp / 1000, rtp));
     EXPECT_FALSE(WaitUntil([&] { return rig.log.Contains("Internal Buffer length : 0"); }, 1200));
 
     rig.buffer->ReceiveVideo(MakeVideo(1000, true));
@@ -414,7 +401,7 @@ TEST(StreamBufferConcurrency, ProducersRaceTheFilingThreadCuttingAndClearing) {
     std::thread audio =
         producer(60, [&](uint64_t, uint64_t ts) { rig.buffer->ReceiveAudio(Audio(ts)); });
     std::thread meta =
-        producer(300, [&](uint64_t, uint64_t ts) { rig.buffer->ReceiveMeta(Meta(ts, ts)); });
+        producer(300, [&](uint64_t, uint64_t ts) { rig.buffer->ReceiveMeta(MakeSample(ts, ts)); });
     pace(kEndMs / 3);
     rig.files->SetCount(UINT64_MAX);
     pace(kEndMs * 2 / 3);
@@ -451,7 +438,7 @@ TEST(StreamBufferConcurrency, FirstIdrTrimmingKeepsSamplesAtTheIdrTimestamp) {
         const auto producer = [&](int kind) {
             for (uint64_t ts = 0; ts <= 2000; ts += 10) {
                 if (kind == 0) rig.buffer->ReceiveAudio(Audio(ts));
-                if (kind == 1) rig.buffer->ReceiveMeta(Meta(ts, ts));
+                if (kind == 1) rig.buffer->ReceiveMeta(MakeSample(ts, ts));
                 if (kind < 2) sent[kind] = ts;
                 // Video past the boundary (1500) only once audio and meta are there too.
                 if (kind == 2 && ts == 1500)

@@ -1,19 +1,9 @@
-// ClipSamples: a media file turned into the samples a media host would deliver, for tests that
-// need real video, audio and meta payloads.
-//
-// LoadClipSamples demuxes with libavformat, puts H.264/H.265 through the *_mp4toannexb filters
-// (parameter sets in band before each IDR) and fills each sample's attribute block as the
-// framework does: rtpTime = pts and attribute2 = dts in the track's media clock (90 kHz for video
-// and meta, the sample rate for audio; negative values of MP4 input are kept in two's
-// complement), timestamp = decode time in ms since the first packet (never decreasing within a
-// track), attribute1 = capture time in µs since the epoch (`captureStartMicros` plus the decode
-// time since the first packet), attribute4 = track index, attribute5 = clock rate,
-// attribute6 = true, attribute7 = packet number within the track. The payload is the packet's
-// own reference-counted buffer (owned by the ReceivedSample); each track's TrackDescription
-// carries a copy of its AVCodecParameters (for video: the Annex B filter's output parameters).
-//
-// Tracks, as the host picks them: the first H.264/H.265 stream, the first audio stream, the first
-// data or subtitle stream.
+// ClipSamples: a media file turned into the samples a media host would deliver. Video goes
+// through the *_mp4toannexb filters; the attribute block is filled as the framework does
+// (rtpTime = pts, attribute2 = dts in the track's clock, timestamp = decode ms since the first
+// packet, never decreasing; attribute1 = capture µs; attribute4 track index, attribute5 clock
+// rate, attribute7 packet number). Tracks as the host picks them: the first H.264/H.265, the
+// first audio, the first data or subtitle stream.
 #pragma once
 
 #include <cstdint>

@@ -26,10 +26,4 @@ void RecordingObserver::notifyTransmissionStatus(
     if (it != entries.end()) uploadInfos_.push_back(it->second);
 }
 
-void RecordingObserver::SetState(VqProcessState state, unsigned code) {
-    std::lock_guard<std::mutex> lock(mutex_);
-    state_ = state;
-    code_ = code;
-}
-
 }  // namespace testsupport

@@ -26,7 +26,7 @@ class RecordingObserver : public Orvane::INotifyObserver, private Guarded {
 
     // Runs on every token request, outside the lock (e.g. to deliver credentials).
     void OnTokenRequest(std::function<void()> action) { Set(tokenAction_, std::move(action)); }
-    void SetState(VqProcessState state, unsigned code);
+    void SetState(VqProcessState state) { Set(state_, state); }
 
     size_t TokenRequests() const { return Get(tokenRequests_); }
     std::vector<SequenceEntry> Entries() const { return Get(entries_); }
@@ -36,7 +36,6 @@ class RecordingObserver : public Orvane::INotifyObserver, private Guarded {
     std::vector<unsigned> Errors() const { return Get(errors_); }
     size_t ExecuteCalls() const { return Get(executes_).size(); }
     VqProcessState State() const { return Get(state_); }
-    unsigned Code() const { return Get(code_); }
 
   private:
     // Records a state notification in `calls` and takes on its state.
@@ -44,7 +43,6 @@ class RecordingObserver : public Orvane::INotifyObserver, private Guarded {
         std::lock_guard<std::mutex> lock(mutex_);
         calls.push_back(code);
         state_ = state;
-        code_ = code;
     }
 
     std::function<void()> tokenAction_;
@@ -55,7 +53,6 @@ class RecordingObserver : public Orvane::INotifyObserver, private Guarded {
     std::vector<unsigned> errors_;
     std::vector<unsigned> executes_;  // one 0 per notifyModuleExecute
     VqProcessState state_ = Executing;
-    unsigned code_ = 0;
 };
 
 }  // namespace testsupport

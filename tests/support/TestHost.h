@@ -1,12 +1,8 @@
 // TestHost: a host driven by a test. The test delivers the host's messages and samples
-// through it and reads back everything the module sent.
-//
-// Run blocks until Finish() is called, so a test can run Execute on a thread of its own and
-// drive the module meanwhile. All members are thread-safe.
+// through it and reads back what the module sent. Run returns at once: the test drives the
+// module itself. All members are thread-safe.
 #pragma once
 
-#include <condition_variable>
-#include <functional>
 #include <map>
 #include <mutex>
 #include <string>
@@ -22,8 +18,7 @@ class TestHost : public IModuleHost {
     };
 
     bool Prepare(BaseProcess& process) override;
-    void Run(BaseProcess& process) override;
-    void Finish();  // makes Run return
+    void Run(BaseProcess&) override {}
 
     // Deliveries to the module (on the caller's thread). Valid after Prepare.
     VqResult ConnectionReply();
@@ -33,18 +28,10 @@ class TestHost : public IModuleHost {
     void Audio(std::shared_ptr<ReceivedSample> sample);
     void Meta(std::shared_ptr<ReceivedSample> sample);
 
-    // Called for every token request, after it was recorded (e.g. to answer it).
-    void OnTokenRequestDo(std::function<void(const GetAWSSecureTokenRequest&)> action);
-
-    std::vector<GetAWSSecureTokenRequest> TokenRequests() const;
     std::vector<LastSequenceNumNotify> SequenceNotifies() const;
     std::vector<TransferStatusNotify> TransmissionStatuses() const;
     std::vector<StatusChange> StatusChanges() const;
 
-    // Waits up to `timeoutMs` until `predicate` holds; re-checked after every message.
-    bool WaitFor(const std::function<bool()>& predicate, int timeoutMs) const;
-
-    void OnTokenRequest(const GetAWSSecureTokenRequest& m) override;
     void OnLastSequenceNumNotify(const LastSequenceNumNotify& m) override;
     void OnTransmissionStatus(const TransferStatusNotify& m) override;
     void OnProcessStatus(VqProcessState state, unsigned int code) override;
@@ -53,12 +40,7 @@ class TestHost : public IModuleHost {
     BaseProcess* process() const;
 
     mutable std::mutex mutex_;
-    mutable std::condition_variable changed_;
     BaseProcess* process_ = nullptr;  // set by Prepare; not owned
-    bool finished_ = false;
-    uint64_t generation_ = 0;  // raised by every message the module sends
-    std::function<void(const GetAWSSecureTokenRequest&)> tokenAction_;
-    std::vector<GetAWSSecureTokenRequest> tokenRequests_;
     std::vector<LastSequenceNumNotify> sequenceNotifies_;
     std::vector<TransferStatusNotify> transmissionStatuses_;
     std::vector<StatusChange> statusChanges_;
