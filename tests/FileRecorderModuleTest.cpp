@@ -218,6 +218,40 @@ TEST(FileRecorderModulePipeline, StreamBecomesNumberedFilesCutBeforeIdrsAndTheDr
     EXPECT_FALSE(log.Contains("queue overflow (video)"));
 }
 
+// A file input asks WaitForBacklog before each burst: a stalled store holds it back before any
+// file would be given up, and once the store works again every file is stored.
+TEST(FileRecorderModulePipeline, AStalledStoreHoldsAFileInputBackAndNoFileIsGivenUp) {
+    LogCapture log;
+    Pipeline p({"-uploadinterval", "1", "-bufferfullsize", "2"});
+    p.transfer->Hold();
+    p.Open(log);
+    Orvane::FileRecorderModule& module = *p.h.Process().Module();
+    const auto in = [](int ms) {
+        return std::chrono::steady_clock::now() + std::chrono::milliseconds(ms);
+    };
+    uint64_t fedMs = 0;
+    while (fedMs < 12000 && module.WaitForBacklog(in(1500))) {
+        p.Stream(fedMs, fedMs + 250, 500);
+        fedMs += 250;
+    }
+    EXPECT_LT(fedMs, 4000u);
+    EXPECT_FALSE(module.WaitForBacklog(in(1200))) << "still held back while the store stalls";
+    p.transfer->Release();
+    while (fedMs < 12000 && module.WaitForBacklog(in(30000))) {
+        p.Stream(fedMs, fedMs + 250, 500);
+        fedMs += 250;
+    }
+    EXPECT_EQ(fedMs, 12000u);
+    EXPECT_TRUE(p.h.Process().drainProcess(30000));
+    uint32_t storedMs = 0;
+    for (const auto& n : p.Notifies()) {
+        EXPECT_TRUE(n.entries.at(0).succeeded) << n.entries.at(0).errorName;
+        storedMs += n.entries.at(0).duration;
+    }
+    EXPECT_GE(storedMs, 11900u);
+    EXPECT_FALSE(log.Contains("Buffer Over."));
+}
+
 TEST(FileRecorderModuleDrain, AStoreThatIsDownEndsAtTheDeadlineNamingWhatIsDropped) {
     LogCapture log;
     Pipeline p({"-uploadinterval", "2", "-bufferfullsize", "10"});

@@ -254,8 +254,8 @@ TEST(ModuleWorkers, AFlushWaitsForTheSamplesBeforeItWhereAnEarlierMarkerLay) {
     }
 }
 
-// A producer that waits for room loses nothing behind a stalled worker; stopping the workers
-// ends its wait.
+// A producer that waits for room loses nothing behind a stalled worker, also when it pushes in
+// bursts that wake the worker only at their end; stopping the workers ends its wait.
 TEST(ModuleConcurrency, AWaitingProducerLosesNothingAndStopEndsItsWait) {
     LogCapture log;
     RecordingModule module;
@@ -267,13 +267,15 @@ TEST(ModuleConcurrency, AWaitingProducerLosesNothingAndStopEndsItsWait) {
     ASSERT_TRUE(module.HoldVideoAt(0));
     std::atomic<uint64_t> pushed{0};
     std::thread producer([&] {
-        for (uint64_t t = 1; t <= 120; ++t) {
-            if (!module.WaitForRoom(1, 0, 0, far())) return;
-            module.PushVideo(MakeSample(t));
-            pushed = t;
+        for (uint64_t t = 1; t <= 120; t += 6) {
+            if (!module.WaitForRoom(6, 0, 0, far())) return;
+            module.BeginBurst();
+            for (uint64_t s = t; s < t + 6; ++s) module.PushVideo(MakeSample(s));
+            module.EndBurst();
+            pushed = t + 5;
         }
     });
-    ASSERT_TRUE(WaitUntil([&] { return pushed.load() == 50; }));  // the queue is full
+    ASSERT_TRUE(WaitUntil([&] { return pushed.load() == 48; }));  // no room for a ninth burst
     module.Release();
     producer.join();
     ASSERT_TRUE(WaitUntil([&] { return module.Count(module.video) == 121; }));
