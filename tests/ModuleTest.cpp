@@ -60,6 +60,10 @@ void* operator new(size_t bytes) {
     return raw + kHeader;
 }
 
+// GCC's -O3 array-bounds check takes the header read below for an access before a vector's
+// storage; the header is ours, written by operator new above.
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Warray-bounds"
 void operator delete(void* block) noexcept {
     if (!block) return;
     char* raw = static_cast<char*>(block) - kHeader;
@@ -76,6 +80,7 @@ void operator delete(void* block) noexcept {
 void operator delete(void* block, size_t) noexcept {
     operator delete(block);
 }
+#pragma GCC diagnostic pop
 
 namespace {
 
