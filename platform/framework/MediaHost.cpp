@@ -139,7 +139,7 @@ void MediaHost::OnLastSequenceNumNotify(const LastSequenceNumNotify& message) {
 void MediaHost::OnProcessStatus(VqProcessState state, unsigned int code) {
     if (state != Error || moduleFailed_.exchange(true)) return;
     Logger::Put(5, kFile, "MediaHost::OnProcessStatus", __LINE__,
-                "module error %u: the input is no longer read; storing what is held, then ending",
+                "module error %u: the input is no longer read and what is held is dropped; ending",
                 code);
     Stop();
 }

@@ -89,7 +89,8 @@ class MediaHost : public IModuleHost {
     // waits: each worker then wakes once per burst rather than once per packet. A burst is
     // bounded by the pacer's slack and by kMaxBatch, so it fits the module's queues. An
     // unpaced file goes in bursts of kMaxBatch. A file waits for room in the module's queues
-    // before each burst and so never loses a sample; a stop during that wait discards the
+    // (and, through the module, for the recorder's backlog of unstored stream) before each
+    // burst and so never loses a sample; a stop during that wait discards the
     // burst as if it had not been read. A live input is handed over packet by packet.
     using Batch = std::vector<std::pair<MediaInput::Packet, SampleClock::Times>>;
     // Receive thread: delivers the packet or moves it into the burst; false when a stop ended
