@@ -1,12 +1,11 @@
 // The crash reporter, seen from outside: programs that crash on purpose (tests/crashprogs) run
-// in a child process from a fresh directory, and the tests read the report appended beside the
-// program. Faults guarded: a report missing the fault's kind, address, module, thread, function,
-// source line, call stack out to main, registers, or its CR LF layout; a stack overflow not
-// walked or walked without cutting it short, or slowly; a second report, or none, when the
-// report itself faults, hangs past its deadline or another thread crashes meanwhile; a process
-// that ends differently with the reporter (signal, core dump) or a previous handler or terminate
-// handler not called; heap allocations of the reporter's own in the signal handler; the recorder
-// itself not reporting a SIGSEGV sent to it.
+// from a fresh directory, and the tests read the report appended beside the program. Faults
+// guarded: a report missing the fault's kind, address, module, thread, function, source line,
+// call stack out to main, registers, or its CR LF layout; a stack overflow not walked, not cut
+// short, or slow; a second report, or none, when the report faults, hangs past its deadline or
+// another thread crashes meanwhile; a process that ends differently with the reporter (signal,
+// core dump) or a previous signal or terminate handler not called; heap allocations of the
+// reporter's own in the handler; the recorder not reporting a SIGSEGV sent to it.
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/stat.h>
@@ -26,24 +25,12 @@ namespace {
 namespace fs = std::filesystem;
 using namespace testsupport;
 
-const char* const kSeparator =
-    "=============================================================================\r\n";
-
 std::string MonthlyLogName() {
-    time_t now = time(nullptr);
+    const time_t now = time(nullptr);
     struct tm local {};
-    localtime_r(&now, &local);
     char name[64];
-    std::snprintf(name, sizeof(name), "_Tracewright%d%02d.log", local.tm_year + 1900,
-                  local.tm_mon + 1);
+    std::strftime(name, sizeof name, "_Tracewright%Y%m.log", localtime_r(&now, &local));
     return name;
-}
-
-int CountOf(const std::string& text, const std::string& piece) {
-    int count = 0;
-    for (size_t at = text.find(piece); at != std::string::npos; at = text.find(piece, at + 1))
-        ++count;
-    return count;
 }
 
 struct Ending {
@@ -82,10 +69,8 @@ class ProgramCopy {
         ending.pid = child.Pid();
         child.Wait(60000);
         ending.finished = child.Ended();
-        if (!ending.finished) {
-            child.Signal(SIGKILL);
-            child.Wait(60000);
-        }
+        child.Signal(SIGKILL);  // when still running
+        child.Wait(60000);
         ending.signal = child.TermSignal();
         ending.core = child.CoreDumped();
         ending.seconds =
@@ -136,7 +121,7 @@ TEST(CrashReportContent, WriteToInvalidAddressNamesTheFaultAndItsPlace) {
     // Title between two separators, with the computer's name.
     char host[256] = {};
     gethostname(host, sizeof(host) - 1);
-    EXPECT_EQ(report.rfind(kSeparator, 0), 0u);
+    EXPECT_EQ(report.rfind(std::string(77, '=') + "\r\n", 0), 0u);
     EXPECT_TRUE(std::regex_search(
         report, std::regex("\r\n  Tracewright's Report --- \\d{4}/\\d\\d/\\d\\d \\d\\d:\\d\\d:"
                            "\\d\\d\\.\\d{3} at " +
@@ -184,7 +169,7 @@ TEST(CrashReportContent, WriteToInvalidAddressNamesTheFaultAndItsPlace) {
 // and a second thread crashing while the first one reports: one report each, and the process
 // still ends by its signal.
 TEST(CrashReportOnce, OneReportWhateverHappensWhileItIsWritten) {
-    const std::pair<const char*, const char*> cases[] = {
+    const std::pair<std::string, const char*> cases[] = {
         {"fault-in-report-same", "Current thread: "},
         {"fault-in-report-other", "Current thread: "},  // what was written before is on disk
         {"hang-in-report", "Access address: BAD0(Write)\r\n"},
@@ -197,17 +182,16 @@ TEST(CrashReportOnce, OneReportWhateverHappensWhileItIsWritten) {
         ASSERT_TRUE(ending.finished);
         EXPECT_EQ(ending.signal, SIGSEGV);
         const std::string report = program.Report();
-        EXPECT_EQ(CountOf(report, "Tracewright's Report"), 1);
+        EXPECT_EQ(CountOf(report, "Tracewright's Report"), 1u);
         EXPECT_NE(report.find(written), std::string::npos);
-        if (std::string(mode) == "two-threads") {
-            EXPECT_NE(ending.output.find("second thread is in the handler"), std::string::npos)
-                << ending.output;
+        if (mode == "two-threads") {
+            EXPECT_NE(ending.output.find("second thread is in the handler"), std::string::npos);
         }
     }
 }
 
 TEST(CrashReportEnding, EachCrashIsNamedAndEndsAsWithoutTheReporter) {
-    const std::pair<const char*, std::string> cases[] = {
+    const std::pair<std::string, std::string> cases[] = {
         {"write-invalid", "Access address: BAD0(Write)\r\n"},
         {"read-invalid", "Access address: BAD0(Read)\r\n"},
         {"divide", "Exception code: C0000094 INT_DIVIDE_BY_ZERO\r\n"},
@@ -220,7 +204,7 @@ TEST(CrashReportEnding, EachCrashIsNamedAndEndsAsWithoutTheReporter) {
     for (const auto& [mode, named] : cases) {
         SCOPED_TRACE(mode);
         ProgramCopy reporting(kReporting);  // both crashes of a mode append to its one report
-        for (const char* coreLimit : {"0", "unlimited"}) {
+        for (const std::string coreLimit : {"0", "unlimited"}) {
             SCOPED_TRACE(coreLimit);
             ProgramCopy plain(kPlain);
             Ending withReporter = reporting.Run(mode, "", coreLimit);
@@ -228,26 +212,26 @@ TEST(CrashReportEnding, EachCrashIsNamedAndEndsAsWithoutTheReporter) {
             EXPECT_NE(without.signal, 0);
             EXPECT_EQ(withReporter.signal, without.signal);
             EXPECT_EQ(withReporter.core, without.core);
-            EXPECT_TRUE(std::string(coreLimit) != "0" || !withReporter.core);
+            EXPECT_TRUE(coreLimit != "0" || !withReporter.core);
             // Starting, recursing through the 8 MB stack and reporting: seconds, not minutes.
-            if (std::string(mode) == "recurse" && std::string(coreLimit) == "0") {
+            if (mode == "recurse" && coreLimit == "0") {
                 EXPECT_LT(withReporter.seconds, 10.0);
             }
             // The previous terminate handler still has its say.
-            if (std::string(mode) == "throw") {
+            if (mode == "throw") {
                 EXPECT_NE(withReporter.output.find("disk full on /data"), std::string::npos);
             }
         }
         const std::string report = reporting.Report();
-        EXPECT_EQ(CountOf(report, named), 2) << report;
-        EXPECT_EQ(CountOf(report, "Tracewright's Report"), 2);
+        EXPECT_EQ(CountOf(report, named), 2u) << report;
+        EXPECT_EQ(CountOf(report, "Tracewright's Report"), 2u);
         EXPECT_EQ(report.find("Access address") != std::string::npos,
                   named.rfind("Access", 0) == 0);
         int logs = 0;
         for (const auto& entry : fs::directory_iterator(reporting.Dir()))
             logs += entry.path().filename().string().rfind("_Tracewright", 0) == 0;
         EXPECT_EQ(logs, 1);
-        if (std::string(mode) != "recurse") continue;
+        if (mode != "recurse") continue;
         // A stack overflow: no function line; the innermost frames, a count of those left out,
         // then the way in from main.
         EXPECT_EQ(report.find("Function      :"), std::string::npos);
@@ -255,7 +239,7 @@ TEST(CrashReportEnding, EachCrashIsNamedAndEndsAsWithoutTheReporter) {
             FirstMatch(report, "\r\n +\\.\\.\\. (\\d+) frames not shown \\.\\.\\.\r\n");
         ASSERT_FALSE(omitted.empty()) << report.substr(0, 4000);
         EXPECT_GT(std::stol(omitted), 1000);
-        EXPECT_GE(CountOf(report, "RecurseForever(int)+"), 256);
+        EXPECT_GE(CountOf(report, "RecurseForever(int)+"), 256u);
         EXPECT_NE(report.find("  main+", report.find(" frames not shown ")), std::string::npos);
     }
 }
@@ -274,22 +258,6 @@ TEST(CrashReportEnding, PreviousHandlerGetsTheSignalAndReportAllocatesNothingOfI
     EXPECT_NE(program.Report().find("Flags : "), std::string::npos);
 }
 
-// True once `pid` runs `program` (exec done) and catches SIGSEGV (the reporter is installed).
-bool CatchesSegv(pid_t pid, const std::string& program) {
-    std::error_code error;
-    fs::path running = fs::read_symlink("/proc/" + std::to_string(pid) + "/exe", error);
-    if (error || running != fs::path(program)) return false;
-    std::ifstream status("/proc/" + std::to_string(pid) + "/status");
-    std::string line;
-    while (std::getline(status, line)) {
-        if (line.rfind("SigCgt:", 0) == 0) {
-            unsigned long long mask = std::stoull(line.substr(7), nullptr, 16);
-            return (mask & (1ULL << (SIGSEGV - 1))) != 0;
-        }
-    }
-    return false;
-}
-
 TEST(CrashReportRecorder, KillSegvLeavesAReportBesideTheExecutable) {
     ProgramCopy recorder("stream-file-recorder");
     // The status output is a FIFO nobody reads: opening it blocks, so the recorder stays in
@@ -302,11 +270,15 @@ TEST(CrashReportRecorder, KillSegvLeavesAReportBesideTheExecutable) {
         "-bufferfullsize 100 -kct h264 -status " +
             fifo,
         "ASAN_OPTIONS=handle_segv=0");
-    const pid_t pid = child->Pid();
-    ASSERT_TRUE(WaitUntil([&] { return CatchesSegv(pid, recorder.Program()); }, 30000));
-    // Then let it reach the blocking open (the kernel names the wait); where wchan is not
-    // shown, the deadline gives it ample time to get there.
-    std::string wchan = "/proc/" + std::to_string(pid) + "/wchan";
+    // The reporter is installed before main, which logs the version first. Then let it reach
+    // the blocking open (the kernel names the wait); where wchan is not shown, the deadline
+    // gives it ample time to get there.
+    ASSERT_TRUE(WaitUntil(
+        [&] {
+            return ReadFile(recorder.Dir() + "/output.txt").find("VQ-VERSION") != std::string::npos;
+        },
+        30000));
+    const std::string wchan = "/proc/" + std::to_string(child->Pid()) + "/wchan";
     WaitUntil([&] { return ReadFile(wchan) == "wait_for_partner"; }, 10000);
     child->Signal(SIGSEGV);
     Ending ending = recorder.Wait(*child);

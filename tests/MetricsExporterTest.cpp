@@ -1,7 +1,7 @@
 // The metrics exporter: what the object events and the process's readings turn into, read from
 // the registry as a scrape would; /healthz by process state; an address it cannot listen at.
 #include <gtest/gtest.h>
-#include <prometheus/metric_family.h>
+#include <prometheus/text_serializer.h>
 #include <sys/socket.h>
 
 #include <mutex>
@@ -13,38 +13,6 @@
 #include "tests/support/TestSupport.h"
 
 namespace {
-
-using Labels = std::vector<prometheus::ClientMetric::Label>;
-
-// The value of the metric `name` with exactly `labels`: a counter's or gauge's value, a
-// histogram's sample count ("_count") or sum ("_sum"). -1 when there is none.
-double Value(const std::vector<prometheus::MetricFamily>& families, std::string name,
-             const Labels& labels = {}) {
-    bool sum = false, count = false;
-    if (name.size() > 4 && name.compare(name.size() - 4, 4, "_sum") == 0) sum = true;
-    if (name.size() > 6 && name.compare(name.size() - 6, 6, "_count") == 0) count = true;
-    const std::string family = sum     ? name.substr(0, name.size() - 4)
-                               : count ? name.substr(0, name.size() - 6)
-                                       : name;
-    for (const auto& f : families) {
-        if (f.name != family) continue;
-        for (const auto& m : f.metric) {
-            if (m.label != labels) continue;
-            switch (f.type) {
-                case prometheus::MetricType::Counter:
-                    return m.counter.value;
-                case prometheus::MetricType::Gauge:
-                    return m.gauge.value;
-                case prometheus::MetricType::Histogram:
-                    return sum ? m.histogram.sample_sum
-                               : static_cast<double>(m.histogram.sample_count);
-                default:
-                    return -1;
-            }
-        }
-    }
-    return -1;
-}
 
 StoredObject Object(FileTransferResult result, uint64_t size, uint32_t responseMs,
                     uint64_t captureMicros) {
@@ -63,12 +31,6 @@ ProcessReadings Readings(VqProcessState state, unsigned code) {
     return r;
 }
 
-struct Expected {
-    std::string name;
-    Labels labels;
-    double value;
-};
-
 }  // namespace
 
 TEST(MetricsExporterTest, EventsAndReadingsBecomeMetricValues) {
@@ -85,54 +47,48 @@ TEST(MetricsExporterTest, EventsAndReadingsBecomeMetricValues) {
         const char* what;
         std::vector<StoredObject> events;
         ProcessReadings readings;
-        std::vector<Expected> expected;
+        std::vector<std::pair<std::string, double>> expected;  // as a scrape shows them
     } cases[] = {
-        {"a stored object",
-         {Object(Success, 1000, 250, 1'500'000)},
-         Readings(Executing, 0),
-         {{"recorder_stored_bytes_total", {}, 1000},
-          {"recorder_transfer_seconds_count", {}, 1},
-          {"recorder_transfer_seconds_sum", {}, 0.25},
-          {"recorder_transfer_attempts_total", {{"result", "Success"}}, 1},
-          {"recorder_last_object_capture_time_seconds", {}, 1.5},
-          {"recorder_process_state", {}, 4},
-          {"recorder_process_status_code", {}, 0}}},
         {"failed attempts store no bytes; an older object leaves the capture time",
          {Object(Success, 10, 100, 9'000'000), Object(NetworkError, 0, 3000, 10'000'000),
           Object(NetworkError, 0, 1000, 10'000'000), Object(Success, 20, 100, 5'000'000)},
          Readings(Executing, 0),
-         {{"recorder_stored_bytes_total", {}, 30},
-          {"recorder_transfer_seconds_count", {}, 4},
-          {"recorder_transfer_seconds_sum", {}, 4.2},
-          {"recorder_transfer_attempts_total", {{"result", "NetworkError"}}, 2},
-          {"recorder_transfer_attempts_total", {{"result", "Success"}}, 2},
-          {"recorder_last_object_capture_time_seconds", {}, 9}}},
+         {{"recorder_stored_bytes_total", 30},
+          {"recorder_transfer_seconds_count", 4},
+          {"recorder_transfer_seconds_sum", 4.2},
+          {"recorder_transfer_attempts_total{result=\"NetworkError\"}", 2},
+          {"recorder_transfer_attempts_total{result=\"Success\"}", 2},
+          {"recorder_last_object_capture_time_seconds", 9},
+          {"recorder_process_state", 4}}},
         {"the process's readings",
          {},
          busy,
-         {{"recorder_objects_total", {{"result", "Success"}}, 3},
-          {"recorder_objects_total", {{"result", "BufferOver"}}, 2},
-          {"recorder_samples_received_total", {{"media", "video"}}, 300},
-          {"recorder_samples_received_total", {{"media", "audio"}}, 470},
-          {"recorder_samples_received_total", {{"media", "meta"}}, 0},
-          {"recorder_queue_overflows_total", {{"media", "meta"}}, 4},
-          {"recorder_queue_overflows_total", {{"media", "video"}}, 0},
-          {"recorder_file_buffer_ms", {}, 12000},
-          {"recorder_file_buffer_limit_ms", {}, 60000},
-          {"recorder_input_reopenings_total", {}, 2},
-          {"recorder_clock_rebases_total", {}, 1},
-          {"recorder_process_state", {}, 6},
-          {"recorder_process_status_code", {}, 26},
-          {"recorder_stored_bytes_total", {}, 0},
-          {"recorder_transfer_seconds_count", {}, 0}}},
+         {{"recorder_objects_total{result=\"Success\"}", 3},
+          {"recorder_objects_total{result=\"BufferOver\"}", 2},
+          {"recorder_samples_received_total{media=\"video\"}", 300},
+          {"recorder_samples_received_total{media=\"audio\"}", 470},
+          {"recorder_samples_received_total{media=\"meta\"}", 0},
+          {"recorder_queue_overflows_total{media=\"meta\"}", 4},
+          {"recorder_queue_overflows_total{media=\"video\"}", 0},
+          {"recorder_file_buffer_ms", 12000},
+          {"recorder_file_buffer_limit_ms", 60000},
+          {"recorder_input_reopenings_total", 2},
+          {"recorder_clock_rebases_total", 1},
+          {"recorder_process_state", 6},
+          {"recorder_process_status_code", 26},
+          {"recorder_stored_bytes_total", 0},
+          {"recorder_transfer_seconds_count", 0}}},
     };
     for (const auto& c : cases) {
         SCOPED_TRACE(c.what);
         MetricsExporter exporter([&c] { return c.readings; });
         for (const auto& event : c.events) ObjectEvents::Publish(event);
-        const auto families = exporter.Collect();
-        for (const auto& e : c.expected)
-            EXPECT_DOUBLE_EQ(Value(families, e.name, e.labels), e.value) << e.name;
+        auto samples =
+            testsupport::Samples(prometheus::TextSerializer().Serialize(exporter.Collect()));
+        for (const auto& [name, value] : c.expected) {
+            ASSERT_EQ(samples.count(name), 1u) << name;
+            EXPECT_DOUBLE_EQ(samples[name], value) << name;
+        }
     }
 }
 

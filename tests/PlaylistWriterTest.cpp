@@ -5,8 +5,11 @@
 #include <map>
 
 #include "platform/playback/PlaylistWriter.h"
+#include "tests/support/TestSupport.h"
 
 namespace {
+
+using testsupport::CountOf;
 
 constexpr uint64_t kHour = 3600000000ULL;
 constexpr uint64_t kNoon = 1796558400000000ULL;  // 2026-12-06T12:00:00.000Z
@@ -26,12 +29,6 @@ class RecordingStore : public IObjectStore {
     std::vector<std::string> order;
     std::map<std::string, std::string> texts;
 };
-
-size_t Count(const std::string& text, const std::string& what) {
-    size_t n = 0;
-    for (size_t at = text.find(what); at != std::string::npos; at = text.find(what, at + 1)) ++n;
-    return n;
-}
 
 class PlaylistWriterTest : public ::testing::Test {
   protected:
@@ -67,17 +64,17 @@ TEST_F(PlaylistWriterTest, BreaksWhereObjectsDoNotFollowEachOther) {
     Stored(1, 6, kNoon + 5 * s + 3000000);           // the capture clock jumped
     Stored(1, 7, kNoon + 6 * s + 3000000 + 900000);  // within the slack
     const std::string live = store_.texts["p/cam1/live.m3u8"];
-    EXPECT_EQ(Count(live, "#EXTINF:10.000,"), 6u);
-    EXPECT_EQ(Count(live, "#EXT-X-DISCONTINUITY\n"), 3u);
+    EXPECT_EQ(CountOf(live, "#EXTINF:10.000,"), 6u);
+    EXPECT_EQ(CountOf(live, "#EXT-X-DISCONTINUITY\n"), 3u);
     EXPECT_NE(live.find("\n2026/12/06/cam1_1_1.ts\n"), std::string::npos) << live;
-    EXPECT_EQ(Count(store_.texts["p/cam1/2026/12/06/12.m3u8"], "#EXT-X-DISCONTINUITY\n"), 3u);
+    EXPECT_EQ(CountOf(store_.texts["p/cam1/2026/12/06/12.m3u8"], "#EXT-X-DISCONTINUITY\n"), 3u);
 
     // A new run starts the live playlist afresh and breaks the hour's.
     Stored(2, 1, kNoon + 8 * s);
-    EXPECT_EQ(Count(store_.texts["p/cam1/live.m3u8"], "#EXTINF"), 1u);
+    EXPECT_EQ(CountOf(store_.texts["p/cam1/live.m3u8"], "#EXTINF"), 1u);
     const std::string hour = store_.texts["p/cam1/2026/12/06/12.m3u8"];
-    EXPECT_EQ(Count(hour, "#EXTINF"), 7u);
-    EXPECT_EQ(Count(hour, "#EXT-X-DISCONTINUITY\n"), 4u);
+    EXPECT_EQ(CountOf(hour, "#EXTINF"), 7u);
+    EXPECT_EQ(CountOf(hour, "#EXT-X-DISCONTINUITY\n"), 4u);
     EXPECT_NE(hour.find("\ncam1_2_1.ts\n"), std::string::npos) << hour;
 }
 
@@ -97,9 +94,9 @@ TEST_F(PlaylistWriterTest, HourClosesOnceALaterHourBegins) {
     const std::string closed = store_.texts["p/cam1/2026/12/06/12.m3u8"];
     EXPECT_NE(closed.find("#EXT-X-PLAYLIST-TYPE:VOD\n"), std::string::npos) << closed;
     EXPECT_EQ(closed.substr(closed.size() - 15), "#EXT-X-ENDLIST\n");
-    EXPECT_EQ(Count(closed, "#EXTINF"), 1u);
-    EXPECT_EQ(Count(store_.texts["p/cam1/2026/12/06/13.m3u8"], "#EXTINF"), 2u);
-    EXPECT_EQ(Count(store_.texts["p/cam1/live.m3u8"], "#EXTINF"), 3u);
+    EXPECT_EQ(CountOf(closed, "#EXTINF"), 1u);
+    EXPECT_EQ(CountOf(store_.texts["p/cam1/2026/12/06/13.m3u8"], "#EXTINF"), 2u);
+    EXPECT_EQ(CountOf(store_.texts["p/cam1/live.m3u8"], "#EXTINF"), 3u);
 
     // Once taken, a closed hour is not written again.
     store_.order.clear();

@@ -1,20 +1,9 @@
-// A program that crashes in the way its first argument names, for the crash reporter's
-// tests. Built twice: with the reporter (SFR_WITH_REPORTER) and without, so that a test can
-// compare how the two processes end.
-//
-//   write-invalid | read-invalid   store to / load from kInvalidAddress
-//   divide                         integer division by zero
-//   recurse                        unbounded recursion on the main thread
-//   throw                          an exception nobody catches
-//   abort                          abort()
-//   fault-in-report-same           SIGSEGV, and another SIGSEGV while the report is written
-//   fault-in-report-other          SIGFPE, and a SIGSEGV while the report is written
-//   hang-in-report                 SIGSEGV whose report never finishes (1 s deadline)
-//   two-threads                    a second thread crashes while the first one's report is
-//                                  being written
-//   count-allocations              a SIGSEGV whose report counts the heap allocations made
-//                                  while it is written; a handler installed before the
-//                                  reporter prints the counts when the signal is passed on
+// A program that crashes in the way its first argument names (see main), for the crash
+// reporter's tests. Built with the reporter (SFR_WITH_REPORTER) and without, so that a test can
+// compare how the two processes end. With the reporter, the report can fault, hang (1 s
+// deadline), meet a second thread's crash, or count the heap allocations made while it is
+// written, which a SIGSEGV handler installed before the reporter prints when the signal is
+// passed on to it.
 #include <pthread.h>
 #include <signal.h>
 #include <sys/syscall.h>
@@ -92,19 +81,15 @@ std::atomic<int> secondThreadId{0};
 std::atomic<bool> secondMayCrash{false};
 
 bool threadBlocksSegv(int tid) {
-    char path[64];
+    char path[64], line[256];
     std::snprintf(path, sizeof(path), "/proc/self/task/%d/status", tid);
     FILE* file = std::fopen(path, "r");
-    if (file == nullptr) return false;
-    char line[256];
     bool blocked = false;
-    while (std::fgets(line, sizeof(line), file) != nullptr) {
-        if (std::strncmp(line, "SigBlk:", 7) == 0) {
-            unsigned long long mask = std::strtoull(line + 7, nullptr, 16);
-            blocked = (mask & (1ULL << (SIGSEGV - 1))) != 0;
-        }
+    while (file != nullptr && std::fgets(line, sizeof(line), file) != nullptr) {
+        if (std::strncmp(line, "SigBlk:", 7) == 0)
+            blocked = (std::strtoull(line + 7, nullptr, 16) & (1ULL << (SIGSEGV - 1))) != 0;
     }
-    std::fclose(file);
+    if (file != nullptr) std::fclose(file);
     return blocked;
 }
 
@@ -209,30 +194,24 @@ int main(int argc, char** argv) {
     if (mode == "throw") ThrowUnhandled();
     if (mode == "abort") std::abort();
 #ifdef SFR_WITH_REPORTER
-    if (mode == "fault-in-report-same") {
+    // A fault while something happens to the report: SIGFPE ("-other") or SIGSEGV.
+    if (mode == "fault-in-report-same" || mode == "fault-in-report-other")
         Tracewright::SetReportHook(faultInsideReport);
-        CallerOfTheFault(WriteToInvalidAddress);
-    }
-    if (mode == "fault-in-report-other") {
-        Tracewright::SetReportHook(faultInsideReport);
-        sink = DivideBy(argc - 2);
-    }
+    if (mode == "fault-in-report-other") sink = DivideBy(argc - 2);
     if (mode == "hang-in-report") {
         Tracewright::SetReportHook(hangInsideReport);
         Tracewright::SetReportDeadline(1);
-        CallerOfTheFault(WriteToInvalidAddress);
     }
     if (mode == "two-threads") {
         pthread_t thread;
         pthread_create(&thread, nullptr, secondThread, nullptr);
         while (secondThreadId.load() == 0) usleep(1000);
         Tracewright::SetReportHook(letSecondThreadCrash);
-        CallerOfTheFault(WriteToInvalidAddress);
     }
-    if (mode == "count-allocations") {
-        counting.store(true);
+    counting.store(mode == "count-allocations");
+    if (mode == "fault-in-report-same" || mode == "hang-in-report" || mode == "two-threads" ||
+        mode == "count-allocations")
         CallerOfTheFault(WriteToInvalidAddress);
-    }
 #endif
     printLine("no such crash mode\n");
     return 2;

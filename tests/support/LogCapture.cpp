@@ -28,8 +28,7 @@ std::vector<LogRecord> LogCapture::Records() const {
 
 std::vector<LogRecord> LogCapture::Find(const std::string& message) const {
     std::vector<LogRecord> found;
-    std::lock_guard<std::mutex> lock(sink_->mutex);
-    for (const auto& r : sink_->records)
+    for (const auto& r : Records())
         if (r.message == message) found.push_back(r);
     return found;
 }
@@ -40,16 +39,14 @@ size_t LogCapture::Count(const std::string& message) const {
 
 size_t LogCapture::CountContaining(const std::string& part, const std::string& also) const {
     size_t n = 0;
-    std::lock_guard<std::mutex> lock(sink_->mutex);
-    for (const auto& r : sink_->records)
+    for (const auto& r : Records())
         n += r.message.find(part) != std::string::npos && r.message.find(also) != std::string::npos;
     return n;
 }
 
 std::vector<std::string> LogCapture::Messages() const {
     std::vector<std::string> messages;
-    std::lock_guard<std::mutex> lock(sink_->mutex);
-    for (const auto& r : sink_->records) messages.push_back(r.message);
+    for (const auto& r : Records()) messages.push_back(r.message);
     return messages;
 }
 

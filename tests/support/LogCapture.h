@@ -1,7 +1,6 @@
-// LogCapture: records every line Logger::Put writes while it lives, whatever the log level.
-//
-// Lines still go to the log destination only when their priority is within its level.
-// Thread-safe; records keep the order in which Put calls finished formatting.
+// LogCapture: records every line Logger::Put writes while it lives, whatever the log level
+// (the log destination still gets only those within its level). Thread-safe; records keep the
+// order in which Put calls finished formatting.
 #pragma once
 
 #include <cstddef>

@@ -9,9 +9,11 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
+#include <regex>
 #include <sstream>
 #include <thread>
 
@@ -28,16 +30,15 @@ bool WaitUntil(const std::function<bool()>& predicate, int timeoutMs) {
 
 namespace {
 std::string pad(std::string unit, size_t bytes) {
-    while (unit.size() < bytes) unit.push_back(static_cast<char>(0x5A));
-    return unit;
+    return unit.size() < bytes ? unit + std::string(bytes - unit.size(), 'Z') : unit;
 }
 const std::string kStart("\x00\x00\x00\x01", 4);
 }  // namespace
 
 std::string H264Idr(size_t bytes) {
-    std::string au = kStart + std::string("\x67\x42\x00\x1e\x95\xa8\x28", 7) + kStart +
-                     std::string("\x68\xce\x3c\x80", 4) + kStart + std::string("\x65\x88\x84", 3);
-    return pad(au, bytes);
+    return pad(kStart + std::string("\x67\x42\x00\x1e\x95\xa8\x28", 7) + kStart +
+                   std::string("\x68\xce\x3c\x80", 4) + kStart + std::string("\x65\x88\x84", 3),
+               bytes);
 }
 
 std::string H264NonIdr(size_t bytes) {
@@ -45,10 +46,10 @@ std::string H264NonIdr(size_t bytes) {
 }
 
 std::string H265Idr(size_t bytes) {
-    std::string au = kStart + std::string("\x40\x01\x0c\x01", 4) + kStart +
-                     std::string("\x42\x01\x01\x01", 4) + kStart + std::string("\x44\x01\xc1", 3) +
-                     kStart + std::string("\x26\x01\xaf", 3);  // type 19
-    return pad(au, bytes);
+    return pad(kStart + std::string("\x40\x01\x0c\x01", 4) + kStart +
+                   std::string("\x42\x01\x01\x01", 4) + kStart + std::string("\x44\x01\xc1", 3) +
+                   kStart + std::string("\x26\x01\xaf", 3),  // type 19
+               bytes);
 }
 
 std::string H265NonIdr(size_t bytes) {
@@ -118,11 +119,8 @@ ProcessResult RunProcess(const std::vector<std::string>& argv, int timeoutMs) {
     {
         ChildProcess child(argv, templ);
         child.Wait(timeoutMs);
-        if (!child.Ended()) {
-            child.Signal(SIGKILL);
-            child.Wait(60000);
-        }
-        result.exitStatus = child.Wait(0);
+        child.Signal(SIGKILL);  // when it still runs
+        result.exitStatus = child.Wait(60000);
         result.signal = child.TermSignal();
     }
     result.output = ReadFile(templ);
@@ -154,9 +152,8 @@ int FreePort(int type) {
 }
 
 std::string ReadFile(const std::string& path) {
-    std::ifstream in(path, std::ios::binary);
     std::stringstream ss;
-    ss << in.rdbuf();
+    ss << std::ifstream(path, std::ios::binary).rdbuf();
     return ss.str();
 }
 
@@ -209,6 +206,87 @@ std::string MediaClip(const std::string& fileName, const std::vector<std::string
     }
     rename(tmp.c_str(), path.c_str());
     return path;
+}
+
+Args operator+(Args a, const Args& b) {
+    a.insert(a.end(), b.begin(), b.end());
+    return a;
+}
+
+size_t CountOf(const std::string& text, const std::string& piece) {
+    size_t n = 0;
+    for (size_t at = text.find(piece); at != std::string::npos; at = text.find(piece, at + 1)) ++n;
+    return n;
+}
+
+std::string TestClip(const std::string& name, int seconds, const std::string& video,
+                     const std::string& filter) {
+    const std::string length = "duration=" + std::to_string(seconds);
+    return MediaClip(name, Words("-f lavfi -i testsrc2=size=320x240:rate=30:" + length + filter +
+                                 " -f lavfi -i sine=frequency=440:sample_rate=48000:" + length +
+                                 " -pix_fmt yuv420p -c:a aac -b:a 64k " +
+                                 (video.empty() ? "-c:v libx264 -preset ultrafast -g 30 "
+                                                  "-keyint_min 30 -sc_threshold 0 -bf 0"
+                                                : video)));
+}
+
+Args Recorder(const std::string& input, const std::string& dir, const Args& extra) {
+    return Args{BuildPath("stream-file-recorder"), "-input", input} +
+           Words(
+               "-streamingid cam1 -uploadinterval 1 -bufferfullsize 100 -authretrytime 3000 "
+               "-kct h264 -bucketname rec") +
+           Args{"-status", dir + "/status.jsonl", "-logfile", dir + "/log.txt"} + extra;
+}
+
+std::string LocalStore(const std::string& dir) {
+    std::filesystem::create_directories(dir + "/store/rec");
+    return "file://" + dir + "/store";
+}
+
+std::vector<std::string> StoredFiles(const std::string& dir, const std::string& suffix) {
+    std::vector<std::pair<long, std::string>> found;
+    const std::regex name(".*_([0-9]+)" + std::regex_replace(suffix, std::regex("\\."), "\\."));
+    for (const auto& entry : std::filesystem::recursive_directory_iterator(dir)) {
+        std::smatch m;
+        const std::string path = entry.path().string();
+        if (entry.is_regular_file() && std::regex_match(path, m, name))
+            found.emplace_back(std::stol(m[1]), path);
+    }
+    std::sort(found.begin(), found.end());
+    std::vector<std::string> paths;
+    for (auto& f : found) paths.push_back(f.second);
+    return paths;
+}
+
+std::string Concatenate(const std::vector<std::string>& files, const std::string& out) {
+    std::ofstream o(out, std::ios::binary);
+    for (const auto& file : files) o << ReadFile(file);
+    return out;
+}
+
+std::vector<std::string> FrameHashes(const std::string& input) {
+    const bool m3u8 = input.size() > 5 && input.substr(input.size() - 5) == ".m3u8";
+    auto r =
+        RunProcess(Words("ffmpeg -v error") +
+                       (m3u8 ? Words("-live_start_index 0 -m3u8_hold_counters 2") : Args{}) +
+                       Args{"-i", input} + Words("-map 0:v -fps_mode passthrough -f framemd5 -"),
+                   120000);
+    std::istringstream in(r.output);
+    std::vector<std::string> hashes;
+    for (std::string line; std::getline(in, line);)
+        if (!line.empty() && line[0] != '#') hashes.push_back(line.substr(line.rfind(' ') + 1));
+    return hashes;
+}
+
+std::map<std::string, double> Samples(const std::string& text) {
+    std::map<std::string, double> samples;
+    std::istringstream lines(text);
+    for (std::string line; std::getline(lines, line);) {
+        if (line.empty() || line[0] == '#') continue;
+        const auto space = line.rfind(' ');
+        samples[line.substr(0, space)] = std::atof(line.c_str() + space + 1);
+    }
+    return samples;
 }
 
 }  // namespace testsupport

@@ -1,4 +1,5 @@
-// Helpers shared by the tests: samples, waits with deadlines, child processes, media clips.
+// Helpers shared by the tests: samples, waits with deadlines, child processes, media clips, and
+// the scaffolding of the tests that run the recorder binary.
 #pragma once
 
 #include <chrono>
@@ -49,20 +50,15 @@ class ChildProcess {
                           const std::string& output = "/dev/null");
     ~ChildProcess();
     void Signal(int signo);
-    // Waits at most `timeoutMs` for the end. Exit code; -1 when killed by a signal or still
-    // running.
-    int Wait(int timeoutMs);
+    int Wait(int timeoutMs);  // the exit code; -1 when killed by a signal or still running
     bool Ended() const { return ended_; }
     int TermSignal() const { return termSignal_; }  // 0 if it exited or still runs
     bool CoreDumped() const { return coreDumped_; }
     int Pid() const { return pid_; }
 
   private:
-    int pid_ = -1;
-    bool ended_ = false;
-    int exitStatus_ = -1;
-    int termSignal_ = 0;
-    bool coreDumped_ = false;
+    int pid_ = -1, exitStatus_ = -1, termSignal_ = 0;
+    bool ended_ = false, coreDumped_ = false;
 };
 
 // `text` split at spaces, for compact argument lists: Words("-c copy -f mpegts").
@@ -91,5 +87,33 @@ std::function<std::string(const std::string&)> EnvOf(std::map<std::string, std::
 
 // An object of `body` under `bucket` and `key`; not copied, so `body` must outlive it.
 ObjectToStore ObjectFor(const std::string& bucket, const std::string& key, const std::string& body);
+
+// Argument lists joined: Words("-c copy") + Args{path}. Bring it in with `using`.
+using Args = std::vector<std::string>;
+Args operator+(Args a, const Args& b);
+
+// How often `piece` occurs in `text` (overlaps included).
+size_t CountOf(const std::string& text, const std::string& piece);
+
+// `seconds` of 30 fps 320x240 test pattern (through `filter`, if any) with a 48 kHz AAC tone,
+// the video encoded with `video` (by default H.264, an IDR every second, no B-frames).
+std::string TestClip(const std::string& name, int seconds, const std::string& video = "",
+                     const std::string& filter = "");
+
+// The recorder binary recording `input` as stream "cam1" into bucket "rec" every second, its
+// status lines and log in `dir` (status.jsonl, log.txt); `extra` overrides.
+Args Recorder(const std::string& input, const std::string& dir, const Args& extra = {});
+// A local store with the bucket "rec" under `dir`/store; its -endpoint.
+std::string LocalStore(const std::string& dir);
+// Files under `dir` named "..._<sequence><suffix>", in sequence order.
+std::vector<std::string> StoredFiles(const std::string& dir, const std::string& suffix = ".ts");
+// The files one after another in `out`; returns `out`.
+std::string Concatenate(const std::vector<std::string>& files, const std::string& out);
+// The MD5 of every decoded video frame of a file or playlist, in output order. A playlist
+// without #EXT-X-ENDLIST is read from its first entry until reloads bring nothing new.
+std::vector<std::string> FrameHashes(const std::string& input);
+
+// A Prometheus text exposition's samples: "name{labels}" -> value.
+std::map<std::string, double> Samples(const std::string& text);
 
 }  // namespace testsupport
