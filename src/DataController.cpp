@@ -144,6 +144,7 @@ DataController::UploadOutcome DataController::uploadUntilSettled(FileTransferReq
         }
         outcome.result =
             haveCredentials ? uploader_->Upload(request, &outcome.info) : AuthenticationError;
+        storeFailing_.store(outcome.result != Success, std::memory_order_relaxed);
         if (outcome.result == Success) {
             onUploaded();
             outcome.succeeded = true;

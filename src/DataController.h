@@ -13,6 +13,7 @@
 // buffer or the observer is called.
 #pragma once
 
+#include <atomic>
 #include <boost/thread/condition_variable.hpp>
 #include <boost/thread/mutex.hpp>
 #include <cstdint>
@@ -46,6 +47,7 @@ class DataController : public IDataController {
     bool WaitForFiles(uint64_t files, std::chrono::steady_clock::time_point deadline) override;
     uint64_t FilesDone() override;
     uint64_t PendingMs() override;
+    bool StoreFailing() override { return storeFailing_.load(std::memory_order_relaxed); }
 
   private:
     // What became of one file: uploaded, or the last failed result and, when given up because
@@ -91,8 +93,9 @@ class DataController : public IDataController {
     const std::shared_ptr<IDataUploader> uploader_;
     bool stop_ = false;  // guarded by mutex_
     std::thread uploadThread_;
-    int32_t consecutiveAuthErrors_ = 0;  // upload thread only; reset by a success
-    AwsInfo credentials_;                // guarded by mutex_
+    int32_t consecutiveAuthErrors_ = 0;      // upload thread only; reset by a success
+    std::atomic<bool> storeFailing_{false};  // the last attempt failed; set by the upload thread
+    AwsInfo credentials_;                    // guarded by mutex_
     const ModuleSettings settings_;
     std::map<int32_t, std::string> resultNames_;   // result value -> name
     std::map<std::string, int32_t> warningCodes_;  // result name -> module warning code

@@ -217,8 +217,11 @@ bool FileRecorderModule::WaitForBacklog(std::chrono::steady_clock::time_point de
     const bool roomy = backlogCondition_.wait_until(lock, deadline, [&] {
         const uint64_t span = buffer->HeldSpanMs();
         const uint64_t pending = controller->PendingMs();
+        // A store that fails gets no such wait: its files are given up as they would be for
+        // a live input, rather than the input stalling until the store works again.
         const bool blocked =
-            span >= spanLimitMs || (fileLimitMs != 0 && span + pending >= pendingLimitMs);
+            span >= spanLimitMs ||
+            (fileLimitMs != 0 && span + pending >= pendingLimitMs && !controller->StoreFailing());
         filingBlocked = blocked && pending == 0;
         return !blocked || (filingBlocked && filingWaitOver);
     });

@@ -158,6 +158,8 @@ TEST(HostCredentialsConcurrencyTest, WholeChainFromAStaticKeyProfileWithRenewal)
         ASSERT_TRUE(first.ok) << first.why;
         EXPECT_EQ(first.source, "shared config files via STS GetSessionToken");
         EXPECT_EQ(first.properties.at("awsAccessKey"), "ASIA1");
+        EXPECT_EQ(first.properties.at("sessionToken"), "tmp-token");
+        EXPECT_EQ(FormValue(sts.Requests().at(0).body, "Action"), "GetSessionToken");
         EXPECT_NE(sts.Requests().at(0).Header("Authorization").find("Credential=AKIAUSER/"),
                   std::string::npos);
 

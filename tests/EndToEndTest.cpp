@@ -4,7 +4,8 @@
 // not reaching the store, a secret in the log (against s3rver); a live UDP input that stops and
 // starts again not recorded across the gap or not a playlist discontinuity, its tail lost on
 // SIGTERM; SIGINT not ending a run in order; /metrics and /healthz disagreeing with the status
-// lines; runs that cannot record or store ending with the wrong status or without the reason.
+// lines; a refused secret making a storm of requests or log lines; runs that cannot record or
+// store ending with the wrong status or without the reason.
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/socket.h>
@@ -318,6 +319,27 @@ TEST(EndToEndTest, ScrapesAgreeWithTheStatusLinesAndSigintEndsTheRunInOrder) {
     const auto objects = StoredFiles(dir + "/store/rec");
     EXPECT_LT(objects.size(), 10u);
     EXPECT_EQ(ReadStatus(dir).sequence.size(), objects.size());
+}
+
+// A wrong secret against a store that refuses every signature: the retries, the token requests
+// and the log stay paced (at most about two PUTs, one token request and 3 KB of log per second).
+TEST(EndToEndTest, RefusedSecretMakesNoStormOfRequestsOrLogLines) {
+    ScriptedHttpServer server(ScriptedHttpServer::Mode::kRespond,
+                              S3ErrorAnswer("403 Forbidden", "SignatureDoesNotMatch"));
+    const std::string dir = ScratchDir("e2e-storm");
+    const int seconds = 12;
+    auto r = RunProcess(Words("env AWS_ACCESS_KEY_ID=AKIDTEST AWS_SECRET_ACCESS_KEY=wrong "
+                              "AWS_SESSION_TOKEN=token") +
+                            Recorder(TestClip("clip_12s.ts", seconds), dir,
+                                     Args{"-endpoint", server.Endpoint()} +
+                                         Words("-draintimeout 1 -bufferfullsize 10")),
+                        120000);
+    const std::string log = ReadFile(dir + "/log.txt");
+    EXPECT_EQ(r.exitStatus, 0) << log.substr(0, 3000);
+    EXPECT_LE(server.Connections(), 2 * seconds);
+    EXPECT_GE(server.Connections(), 2);
+    EXPECT_LE(ReadStatus(dir).tokenRequests, static_cast<size_t>(seconds));
+    EXPECT_LT(log.size(), 3000u * seconds);
 }
 
 // Inputs the recorder cannot take end the start (status 1); a module error ends the run with

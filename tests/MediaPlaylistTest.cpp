@@ -26,7 +26,7 @@ TEST(MediaPlaylistTest, Texts) {
           {"c.ts", 40, kNoon + 60000000, true, ""}},
          true,
          head + "#EXT-X-TARGETDURATION:11\n" + tail +
-             "#EXT-X-PLAYLIST-TYPE:VOD\n#EXT-X-INDEPENDENT-SEGMENTS\n"
+             "#EXT-X-PLAYLIST-TYPE:VOD\n"
              "#EXT-X-PROGRAM-DATE-TIME:2026-12-06T12:00:00.000Z\n#EXTINF:9.966,\na.ts\n"
              "#EXT-X-PROGRAM-DATE-TIME:2026-12-06T12:00:09.966Z\n#EXTINF:10.001,\nb.ts\n"
              "#EXT-X-DISCONTINUITY\n"
@@ -40,7 +40,7 @@ TEST(MediaPlaylistTest, Texts) {
           {"c.m4s", 2000, kNoon + 9000000, true, "i2.mp4"}},
          false,
          "#EXTM3U\n#EXT-X-VERSION:6\n#EXT-X-TARGETDURATION:2\n" + tail +
-             "#EXT-X-PLAYLIST-TYPE:EVENT\n#EXT-X-INDEPENDENT-SEGMENTS\n"
+             "#EXT-X-PLAYLIST-TYPE:EVENT\n"
              "#EXT-X-MAP:URI=\"i1.mp4\"\n"
              "#EXT-X-PROGRAM-DATE-TIME:2026-12-06T12:00:00.000Z\n#EXTINF:2.000,\na.m4s\n"
              "#EXT-X-PROGRAM-DATE-TIME:2026-12-06T12:00:02.000Z\n#EXTINF:2.000,\nb.m4s\n"

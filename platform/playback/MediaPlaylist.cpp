@@ -19,8 +19,6 @@ std::string MediaPlaylist::Text() const {
     text += "#EXT-X-TARGETDURATION:" + std::to_string(targetSeconds) + "\n";
     text += "#EXT-X-MEDIA-SEQUENCE:0\n";
     text += type_ == Type::kEvent ? "#EXT-X-PLAYLIST-TYPE:EVENT\n" : "#EXT-X-PLAYLIST-TYPE:VOD\n";
-    // Every object begins with an IDR picture.
-    text += "#EXT-X-INDEPENDENT-SEGMENTS\n";
     const std::string* map = nullptr;
     for (size_t i = 0; i < entries_.size(); ++i) {
         const PlaylistEntry& entry = entries_[i];
