@@ -28,8 +28,8 @@ class IDataController {
     // ms of stream not yet done: the buffer's count plus the file in hand.
     virtual uint64_t PendingMs() = 0;
     // True while the store refuses or fails: the last transfer attempt did not succeed. Any
-    // thread. A controller that cannot tell (a test double) says false.
-    virtual bool StoreFailing() { return false; }
+    // thread.
+    virtual bool StoreFailing() = 0;
 };
 
 }  // namespace Orvane

@@ -28,12 +28,12 @@ class IStreamBuffer {
     // files and pushes them; the last one runs to the newest held sample, inclusive, and is
     // pushed however short. Nothing is cut after Stop or before the first IDR.
     virtual void CutRemaining() = 0;
-    // Milliseconds of stream time the held samples span (0 when nothing is held, and for a
-    // buffer that cannot tell). Any thread; takes the holding lists' locks one at a time.
-    virtual uint64_t HeldSpanMs() { return 0; }
+    // Milliseconds of stream time the held samples span (0 when nothing is held). Any thread;
+    // takes the holding lists' locks one at a time.
+    virtual uint64_t HeldSpanMs() = 0;
     // `hook` runs on the filing thread after every tick, with none of the buffer's locks held
     // (the held span may have shrunk). Set before Start.
-    virtual void SetTickHook(std::function<void()> hook) { (void)hook; }
+    virtual void SetTickHook(std::function<void()> hook) = 0;
 };
 
 }  // namespace Orvane
