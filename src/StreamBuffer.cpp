@@ -97,7 +97,7 @@ void StreamBuffer::ReceiveVideo(std::shared_ptr<StreamData> sample) {
     const bool idr = nalAnalyzer_->IsIDR(sample);
     const unsigned long long timestamp = sample->timestamp;
 
-    std::lock_guard<std::mutex> gopLock(gopMutex_);
+    std::unique_lock<std::mutex> gopLock(gopMutex_);
     if (!idr) {
         // The emptiness test and the append share one holding of the GOP lock: a clearing by
         // the filing thread cannot come between them.
@@ -130,12 +130,27 @@ void StreamBuffer::ReceiveVideo(std::shared_ptr<StreamData> sample) {
         }
         firstIdrPending_ = false;
     }
+    gopLock.unlock();
+    if (timestamp >= nextBoundary_.load(std::memory_order_relaxed)) nudgeFiling(videoNudged_);
 }
 
 void StreamBuffer::ReceiveAudio(std::shared_ptr<StreamData> sample) {
     signalFirstSample();
-    std::lock_guard<std::mutex> lock(audioMutex_);
-    audio_.push_back(std::move(sample));
+    const uint64_t timestamp = sample->timestamp;
+    {
+        std::lock_guard<std::mutex> lock(audioMutex_);
+        audio_.push_back(std::move(sample));
+    }
+    if (timestamp >= nextBoundary_.load(std::memory_order_relaxed)) nudgeFiling(audioNudged_);
+}
+
+void StreamBuffer::nudgeFiling(std::atomic<bool>& nudged) {
+    if (nudged.exchange(true, std::memory_order_relaxed)) return;
+    // Without the filing mutex, which a tick holds throughout: the intake never waits for a
+    // tick. A nudge that comes just before the filing thread waits is lost, which only costs
+    // what the nudge would have saved (the wait ends at the tick's deadline anyway).
+    nudge_.store(true);
+    tickWait_.notify_all();
 }
 
 void StreamBuffer::ReceiveMeta(std::shared_ptr<StreamData> sample) {

@@ -89,6 +89,13 @@ class StreamBuffer : public IStreamBuffer {
     // Sets the data-received flag and wakes the data wait, once. Takes the filing mutex only
     // the first time; never called with a holding-list lock held.
     void signalFirstSample();
+    // A sample at or past the next file's boundary arrived: wakes the filing thread for an
+    // early tick, once per boundary and medium, so that a file is cut when its data is there
+    // rather than at the next 500 ms tick. Takes no lock.
+    void nudgeFiling(std::atomic<bool>& nudged);
+    // Filing thread, after each tick: the boundary the intake compares against, and the
+    // nudges armed again.
+    void publishBoundary();
     // Removes from `list` the samples older than `timestamp`; caller holds the list's lock.
     static void dropOlderThan(SampleList& list, uint64_t timestamp);
 
@@ -151,6 +158,11 @@ class StreamBuffer : public IStreamBuffer {
     std::atomic<bool> dataReceived_{false};    // a sample arrived since Start
     std::atomic<bool> firstIdrPending_{true};  // no IDR yet since Start (written under GOP lock)
     std::atomic<uint64_t> recordingOrigin_;    // ms; startIgnoreTime until the first IDR
+    // The next file's boundary (ms) as of the last tick; none until filing starts. Relaxed: a
+    // stale value only makes a nudge early or late by one tick.
+    std::atomic<uint64_t> nextBoundary_{UINT64_MAX};
+    std::atomic<bool> videoNudged_{false};  // this boundary's video nudge was given
+    std::atomic<bool> audioNudged_{false};  // this boundary's audio nudge was given
 
     // Filing state, filing thread only.
     int32_t intervalLength_ = 0;        // ms, uploadInterval x 1000 (32-bit)
@@ -172,8 +184,9 @@ class StreamBuffer : public IStreamBuffer {
     boost::condition_variable dataWait_;
     boost::condition_variable tickWait_;
     std::thread filingThread_;
-    std::mutex lifecycleMutex_;   // serialises Start and Stop (and the join)
-    bool filingStarted_ = false;  // guarded by filingMutex_: the thread left its data wait
+    std::mutex lifecycleMutex_;       // serialises Start and Stop (and the join)
+    bool filingStarted_ = false;      // guarded by filingMutex_: the thread left its data wait
+    std::atomic<bool> nudge_{false};  // tick early (nudgeFiling)
 };
 
 }  // namespace Orvane

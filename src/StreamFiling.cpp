@@ -28,6 +28,12 @@ uint64_t widen(int32_t value) {
 }
 }  // namespace
 
+void StreamBuffer::publishBoundary() {
+    videoNudged_.store(false, std::memory_order_relaxed);
+    audioNudged_.store(false, std::memory_order_relaxed);
+    nextBoundary_.store(fileBoundary(), std::memory_order_relaxed);
+}
+
 uint64_t StreamBuffer::fileBoundary() const {
     return recordingOrigin_.load() + filedTime_ + widen(intervalLength_);
 }
@@ -41,6 +47,7 @@ void StreamBuffer::createStreamFile() {
         dataWait_.wait(lock, [this] { return stop_.load() || dataReceived_.load(); });
         filingStarted_ = true;  // the interval and limits above are set from now on
     }
+    publishBoundary();
     // Wall time counts from the first sample on.
     const uint32_t startTick = timeManager_->GetTime();
     uint32_t workTime = 0;  // ms the previous tick's work took
@@ -56,7 +63,8 @@ void StreamBuffer::createStreamFile() {
         const int32_t work = std::max<int32_t>(0, static_cast<int32_t>(workTime));
         const auto deadline =
             boost::chrono::steady_clock::now() + boost::chrono::milliseconds(kTickMs - work);
-        tickWait_.wait_until(lock, deadline, [this] { return stop_.load(); });
+        tickWait_.wait_until(lock, deadline, [this] { return stop_.load() || nudge_.load(); });
+        nudge_.store(false);
 
         const uint32_t now = timeManager_->GetTime();
         calculateInternalBufferSize(now, startTick);
@@ -67,6 +75,7 @@ void StreamBuffer::createStreamFile() {
             catchUp();
         }
         lock.unlock();
+        publishBoundary();
         if (tickHook_) tickHook_();
         workTime = timeManager_->GetTime() - now;
     }
