@@ -43,9 +43,9 @@ std::shared_ptr<ReceivedSample> sample(uint64_t ms, bool idr) {
 }
 
 void measure(bool feed) {
-    std::vector<std::string> args = {"bench",     "-bucketname",    "b",    "-uploadinterval",
-                                     "2",         "-authretrytime", "1000", "-bufferfullsize",
-                                     "5",         "-kct",           "h264", "-status",
+    std::vector<std::string> args = {"bench",     "-bucketname",    "bench-idle", "-uploadinterval",
+                                     "2",         "-authretrytime", "1000",       "-bufferfullsize",
+                                     "5",         "-kct",           "h264",       "-status",
                                      "/dev/null", "-loglevel",      "4"};
     std::vector<char*> argv;
     for (auto& a : args) argv.push_back(a.data());
