@@ -52,6 +52,17 @@ class BoundedQueue {
         return true;
     }
 
+    // Appends `item` even when the queue is full (a control item that must not be refused,
+    // such as a flush marker); `ticket` as for Push.
+    void PushAlways(T item, uint64_t* ticket) {
+        {
+            std::lock_guard<std::mutex> lock(mutex_);
+            items_.push_back(Entry{std::move(item), ++lastTicket_});
+            *ticket = lastTicket_;
+        }
+        notEmpty_.notify_one();
+    }
+
     // Wakes the consumer for the items pushed without waking it.
     void Wake() { notEmpty_.notify_one(); }
 
@@ -96,7 +107,7 @@ class BoundedQueue {
     bool WaitForRoom(uint64_t room, std::chrono::steady_clock::time_point deadline) {
         std::unique_lock<std::mutex> lock(mutex_);
         const uint64_t wanted = std::min(std::max<uint64_t>(room, 1), capacity_);
-        const auto roomy = [&] { return capacity_ - items_.size() >= wanted; };
+        const auto roomy = [&] { return freePlaces() >= wanted; };
         if (roomy()) return true;
         roomWanted_ = wanted;
         notFull_.wait_until(lock, deadline, [&] { return waitsEnded_ || roomy(); });
@@ -132,7 +143,11 @@ class BoundedQueue {
   private:
     // Caller holds mutex_. Wakes the waiting producer once the room it asked for is there.
     void wakeRoomWaiter() {
-        if (roomWanted_ != 0 && capacity_ - items_.size() >= roomWanted_) notFull_.notify_one();
+        if (roomWanted_ != 0 && freePlaces() >= roomWanted_) notFull_.notify_one();
+    }
+    // Caller holds mutex_. Free places; none while PushAlways has filled the queue beyond.
+    uint64_t freePlaces() const {
+        return items_.size() >= capacity_ ? 0 : capacity_ - items_.size();
     }
 
     std::deque<Entry> items_;  // oldest at the front

@@ -48,8 +48,10 @@ void Module::FlushQueues() {
     std::unique_lock<std::mutex> lock(markerMutex_);
     auto marker = std::make_shared<StreamData>();
     for (Lane& lane : lanes_) {
+        // Even into a full queue: a file input fills the queues to the brim, and a flush that
+        // skipped a full one would return before its samples were handled.
         uint64_t ticket = 0;
-        if (!lane.queue.Push(marker, &ticket)) continue;  // full: the worker is far behind
+        lane.queue.PushAlways(marker, &ticket);
         // Tickets grow with every push and the worker handles items in ticket order, so a
         // handled marker at or past ours means ours was handled (or cleared away).
         lane.markerHandled.wait(

@@ -216,32 +216,34 @@ TEST(ModuleWorkers, ClearQueuesBeforeInitializeEmptiesAfterItKeepsMarkers) {
 
 // A flush must wait for its own marker even where an earlier marker's memory is reused: the
 // video hook is held while samples and the new marker queue behind it.
-TEST(ModuleWorkers, AFlushWaitsForTheSamplesBeforeItWhereAnEarlierMarkerLay) {
+TEST(ModuleWorkers, AFlushWaitsForTheSamplesBeforeItWhereAnEarlierMarkerLayOrTheQueueIsFull) {
     const struct {
         const char* before;
         void (*step)(RecordingModule&);
+        size_t queued;  // video samples queued behind the held one (50 fill the queue)
     } cases[] = {
-        {"an earlier flush", [](RecordingModule& m) { m.FlushQueues(); }},
-        {"a restart", [](RecordingModule& m) { m.Restart(); }},
+        {"an earlier flush", [](RecordingModule& m) { m.FlushQueues(); }, 9},
+        {"a restart", [](RecordingModule& m) { m.Restart(); }, 9},
+        {"a full queue", [](RecordingModule&) {}, 50},
     };
     for (const auto& c : cases) {
         SCOPED_TRACE(c.before);
         // Every sample exists before the earlier marker is freed and stays alive, so the next
         // block of a sample's size that is handed out is the new flush's marker.
         std::vector<std::shared_ptr<StreamData>> samples;
-        for (uint64_t t = 0; t < 12; ++t) samples.push_back(MakeSample(t));
+        for (uint64_t t = 0; t < c.queued + 3; ++t) samples.push_back(MakeSample(t));
         RecordingModule module;
         module.Initialize(nullptr);
         module.StartThreads();
         Recycling recycling;
         c.step(module);
         // Each worker handles a sample, so it has let go of the earlier marker.
-        module.PushAudio(samples[10]);
-        module.PushMeta(samples[11]);
+        module.PushAudio(samples[c.queued + 1]);
+        module.PushMeta(samples[c.queued + 2]);
         ASSERT_TRUE(module.HoldVideo(samples[0]));
         ASSERT_TRUE(WaitUntil(
             [&] { return module.Count(module.audio) == 1 && module.Count(module.meta) == 1; }));
-        for (size_t i = 1; i < 10; ++i) module.PushVideo(samples[i]);
+        for (size_t i = 1; i <= c.queued; ++i) module.PushVideo(samples[i]);
 
         std::atomic<bool> returned{false};
         size_t handledAtReturn = 0;
@@ -253,7 +255,7 @@ TEST(ModuleWorkers, AFlushWaitsForTheSamplesBeforeItWhereAnEarlierMarkerLay) {
         WaitUntil([&] { return returned.load(); }, 300);  // room to return too early
         module.Release();
         flusher.join();
-        EXPECT_EQ(handledAtReturn, 10u);
+        EXPECT_EQ(handledAtReturn, c.queued + 1);
         // Flush markers never reach the hooks.
         EXPECT_EQ(module.Count(module.audio) + module.Count(module.meta), 2u);
     }
