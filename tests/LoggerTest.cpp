@@ -58,6 +58,12 @@ TEST(LoggerFormat, ControlCharactersEscapedRepeatedWarningsCondensedLinksNotFoll
     const std::string link = dir + "/link.txt";
     ASSERT_EQ(symlink(path.c_str(), link.c_str()), 0);
     EXPECT_FALSE(Logger::SetFile(link));
+    // The system's links to the process's own streams are followed.
+    for (const char* own : {"/dev/stderr", "/proc/self/fd/2"}) {
+        const int fd = Logger::OpenAppend(own);
+        EXPECT_GE(fd, 0) << own;
+        if (fd >= 0) close(fd);
+    }
 }
 
 TEST(LoggerConcurrency, ConcurrentWritersLoseNoLine) {

@@ -135,7 +135,9 @@ bool Logger::Enabled(int priority) {
 }
 
 int Logger::OpenAppend(const std::string& path) {
-    const bool systemLink = path.rfind("/dev/", 0) == 0 || path.rfind("/proc/self/fd/", 0) == 0;
+    // Not all of /dev/: /dev/shm is writable by anyone.
+    const bool systemLink = path == "/dev/stdout" || path == "/dev/stderr" ||
+                            path.rfind("/dev/fd/", 0) == 0 || path.rfind("/proc/self/fd/", 0) == 0;
     const int flags = O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | (systemLink ? 0 : O_NOFOLLOW);
     return open(path.c_str(), flags, 0640);
 }

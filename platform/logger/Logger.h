@@ -36,9 +36,9 @@ class Logger {
 
     // Opens `path` for appending the way the log and the status output are: created 0640
     // (the lines name streams and objects), and never through a symbolic link at the last
-    // component, which someone else may have planted, except under /dev/ and /proc/self/fd/,
-    // where the system's own links name this process's streams (-logfile /dev/stderr). A
-    // descriptor the caller owns, or -1 with errno set.
+    // component, which someone else may have planted, except the system's own links to this
+    // process's streams: /dev/stdout, /dev/stderr, /dev/fd/N, /proc/self/fd/N. A descriptor
+    // the caller owns, or -1 with errno set.
     static int OpenAppend(const std::string& path);
 
     // Also hands every line with a priority number up to `level` to `sink`, whatever the level
