@@ -219,9 +219,8 @@ bool FileRecorderModule::WaitForBacklog(std::chrono::steady_clock::time_point de
         const uint64_t pending = controller->PendingMs();
         // A store that fails gets no such wait: its files are given up as they would be for
         // a live input, rather than the input stalling until the store works again.
-        const bool blocked =
-            span >= spanLimitMs ||
-            (fileLimitMs != 0 && span + pending >= pendingLimitMs && !controller->StoreFailing());
+        const bool blocked = span >= spanLimitMs ||
+                             (span + pending >= pendingLimitMs && !controller->StoreFailing());
         filingBlocked = blocked && pending == 0;
         return !blocked || (filingBlocked && filingWaitOver);
     });

@@ -71,8 +71,8 @@ class FileRecorderModule : public Module {
     // half the span at which filing drops everything held ("input buffer overflow"), or so
     // much unstored stream that the file buffer would reach its limit (files given up as
     // BufferOver) while the store works; a failing store holds nothing back. Woken by the
-    // filing thread's ticks and the upload thread's pops. True when below
-    // both; false at `deadline`. Without a connected pipeline there is nothing to wait for.
+    // filing thread's ticks and the upload thread's pops. True when below both; false at
+    // `deadline`. Without a connected pipeline there is nothing to wait for.
     bool WaitForBacklog(std::chrono::steady_clock::time_point deadline);
 
     // The file buffer's level and limit in ms, for monitoring; both 0 before Connect. Any thread.

@@ -1,12 +1,11 @@
 #include "platform/transfer/SigV4Signer.h"
 
-#include <time.h>
-
 #include <algorithm>
 #include <cctype>
 
 #include "platform/transfer/Digest.h"
 #include "platform/transfer/HttpText.h"
+#include "platform/transfer/UtcTime.h"
 
 namespace {
 
@@ -56,12 +55,7 @@ std::string SigV4Signer::CanonicalQuery(const std::string& query) {
 }
 
 std::string SigV4Signer::AmzDate(std::chrono::system_clock::time_point time) {
-    time_t seconds = std::chrono::system_clock::to_time_t(time);
-    struct tm utc {};
-    gmtime_r(&seconds, &utc);
-    char text[32];
-    strftime(text, sizeof text, "%Y%m%dT%H%M%SZ", &utc);
-    return text;
+    return FormatUtc(time, "%Y%m%dT%H%M%SZ");
 }
 
 SigV4Signature SigV4Signer::Sign(const SigV4Request& request, const SigV4Key& key,

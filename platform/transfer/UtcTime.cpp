@@ -48,6 +48,14 @@ std::string UtcDatePath(uint64_t micros) {
     return text;
 }
 
+std::string FormatUtc(std::chrono::system_clock::time_point time, const char* format) {
+    time_t seconds = std::chrono::system_clock::to_time_t(time);
+    struct tm utc {};
+    gmtime_r(&seconds, &utc);
+    char text[64];
+    return strftime(text, sizeof text, format, &utc) != 0 ? std::string(text) : std::string();
+}
+
 uint64_t UtcNowMicros() {
     return static_cast<uint64_t>(std::chrono::duration_cast<std::chrono::microseconds>(
                                      std::chrono::system_clock::now().time_since_epoch())

@@ -2,6 +2,7 @@
 // Pure functions; safe on any thread.
 #pragma once
 
+#include <chrono>
 #include <cstdint>
 #include <string>
 
@@ -11,5 +12,8 @@ std::string CompactUtcTime(uint64_t micros);
 std::string IsoUtcTime(uint64_t micros);
 // `micros` as the folders of its day, 2026/12/06.
 std::string UtcDatePath(uint64_t micros);
+// `time` to the second in UTC through strftime's `format` ("%Y%m%dT%H%M%SZ" for AWS's
+// X-Amz-Date, "%Y-%m-%dT%H:%M:%SZ" for the ISO times AWS services answer with).
+std::string FormatUtc(std::chrono::system_clock::time_point time, const char* format);
 // The wall clock now, in µs since the Unix epoch.
 uint64_t UtcNowMicros();

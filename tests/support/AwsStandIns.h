@@ -3,23 +3,17 @@
 // metadata service.
 #pragma once
 
-#include <time.h>
-
 #include <chrono>
 #include <string>
 
+#include "platform/transfer/UtcTime.h"
 #include "tests/support/ScriptedHttpServer.h"
 
 namespace testsupport {
 
 // "2026-01-02T03:04:05Z".
 inline std::string IsoTime(std::chrono::system_clock::time_point time) {
-    time_t seconds = std::chrono::system_clock::to_time_t(time);
-    struct tm utc {};
-    gmtime_r(&seconds, &utc);
-    char text[32];
-    strftime(text, sizeof text, "%Y-%m-%dT%H:%M:%SZ", &utc);
-    return text;
+    return FormatUtc(time, "%Y-%m-%dT%H:%M:%SZ");
 }
 
 // STS's 200 answer to `action` ("AssumeRole", "GetSessionToken", ...) carrying credentials.
